@@ -1,0 +1,1 @@
+#include <tolk_platform/device_root.h>

@@ -1,0 +1,15 @@
+// Single bytes of the product-information record in NVRAM, read and written by index.
+#ifndef TOLKD_CIT_PRO_INFO_H
+#define TOLKD_CIT_PRO_INFO_H
+
+#define PRODUCT_INFO_FILE_NO 61
+#define PRODUCT_INFO_SIZE 1024
+
+#define FLAG_MMI1_RESULT 202
+#define FLAG_RESET_STATE 208
+#define FLAG_USER_AT 209
+
+int getFlag(int index);
+void setFlag(int index, unsigned char value);
+
+#endif

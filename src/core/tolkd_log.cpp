@@ -1,0 +1,6 @@
+#include "core/tolkd_log.h"
+
+const int android_log_lvl_convert[8] = {
+    ANDROID_LOG_SILENT, ANDROID_LOG_SILENT, ANDROID_LOG_FATAL, ANDROID_LOG_ERROR,
+    ANDROID_LOG_WARN,   ANDROID_LOG_INFO,   ANDROID_LOG_INFO,  ANDROID_LOG_DEBUG,
+};

@@ -1,0 +1,52 @@
+// The command tables and the dispatcher that gives every command line its type,
+// running the local handlers on the way.
+#ifndef TOLKD_DISPATCH_DISPATCHER_H
+#define TOLKD_DISPATCH_DISPATCHER_H
+
+#define RIL_TYPE 1
+#define AUDIO_TYPE 2
+#define TOLK_TYPE 4
+#define GENERIC_TYPE 5
+#define BAT_TYPE 6
+#define AUDIO_EXT_TYPE 7
+#define BELVO_AUDIO_TYPE 9
+#define BELVO_AUTIOCIT_TYPE 10
+
+#define CMD_NAME_SIZE 32
+#define RESPONSE_BUF_SIZE 2048
+
+// A local handler: parameter text, operation form, 2048-byte response buffer.
+typedef int (*CmdHandler)(const char *param, int opType, char *response);
+
+typedef struct CustomCmd {
+    char cmdName[CMD_NAME_SIZE];
+    unsigned int supportOp;
+    CmdHandler handler;
+} CustomCmd;
+
+typedef struct NamedCmd {
+    char cmdName[CMD_NAME_SIZE];
+} NamedCmd;
+
+typedef struct RilMmiCmd {
+    char cmdName[CMD_NAME_SIZE];
+    unsigned int supportOp;
+} RilMmiCmd;
+
+typedef struct DestCmd {
+    char cmdName[CMD_NAME_SIZE];
+    int dest;
+} DestCmd;
+
+int process_cmd_line(const char *line);
+int ril_command_hdlr(const char *line);
+int custom_command_hdlr(const char *line);
+int generic_command_hdlr(const char *line);
+int audio_command_hdlr(const char *line);
+int belvo_audio_command_hdlr(const char *line);
+
+// Copies the command name (the line up to the first "=" or "?") into out;
+// returns 0, or -1 when it does not fit (which counts as no match).
+int getCmdName(const char *line, char *out, int size);
+
+#endif

@@ -1,0 +1,30 @@
+// Matching modem answers to customer MMI commands by counting: commands routed to
+// the modem minus answers received, and per queued command the answers still due.
+#ifndef TOLKD_TARGETS_MMI_QUEUE_H
+#define TOLKD_TARGETS_MMI_QUEUE_H
+
+#include <stdbool.h>
+
+#define MMI_QUEUE_SIZE 10
+#define MMI_CMD_TEXT_SIZE 512
+
+typedef struct MmiCmdSeq {
+    char cmd[MMI_QUEUE_SIZE][MMI_CMD_TEXT_SIZE];
+    int SIdx;
+    int EIdx;
+    int idx;
+    int deSeqIdx;
+    int enSeqIdx;
+    int seq[MMI_QUEUE_SIZE];
+    int cusMmiCmdPending;
+} MmiCmdSeq;
+
+extern MmiCmdSeq gMmiCmdSeq;
+
+// Zeroes the record and frees every queue entry (called by initSerialDevice).
+void mmiCmdSeqReset(void);
+void mmiCmdSeqEnQueue(void);
+bool mmiCmdSeqDeQueue(void);
+void sendCusMMICmdRspToMMI(const char *rsp);
+
+#endif
