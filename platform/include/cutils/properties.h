@@ -16,6 +16,8 @@ extern "C" {
 int property_get(const char *key, char *value, const char *default_value);
 // Sets key to value; 0 on success, negative on failure.
 int property_set(const char *key, const char *value);
+// Calls propfn once for every property that is set.
+int property_list(void (*propfn)(const char *key, const char *value, void *cookie), void *cookie);
 
 #ifdef __cplusplus
 }
