@@ -17,5 +17,10 @@ int adb_socket_listen(int fd);
 int getBootMode(void);
 // Routes one line that readline produced (the routing half of one loop pass).
 void routeCommandLine(SerialDevice *dev, char *line);
+// What readerLoop does once before its first wait: SIGPIPE handler, operator code,
+// PCT mode property.
+void readerLoopPreamble(void);
+// Forgets an adb line that is still being assembled (its connection is gone).
+void discardAdbLine(void);
 
 #endif
