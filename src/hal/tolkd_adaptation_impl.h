@@ -1,0 +1,83 @@
+// The radio HAL bridge's object and callback classes. Private to the bridge and its
+// tests; the rest of the daemon uses the plain entry points of tolkd_adaptation.h.
+#ifndef TOLKD_HAL_TOLKD_ADAPTATION_IMPL_H
+#define TOLKD_HAL_TOLKD_ADAPTATION_IMPL_H
+
+#include <pthread.h>
+#include <stdint.h>
+
+#include <android/hardware/radio/1.0/types.h>
+#include <android/hidl/base/1.0/IBase.h>
+#include <hidl/HidlSupport.h>
+#include <hidl/Status.h>
+#include <utils/RefBase.h>
+#include <vendor/orvane/hardware/radio/2.0/IRadio.h>
+#include <vendor/orvane/hardware/radio/2.0/ITolkIndication.h>
+#include <vendor/orvane/hardware/radio/2.0/ITolkResponse.h>
+
+#define TOLKD_SIM_SLOT_COUNT 4
+
+class TolkdAdaptation;
+
+// Receives the modem's answers on a HIDL runtime thread.
+class TolkResponse : public vendor::orvane::hardware::radio::V2_0::ITolkResponse {
+public:
+    explicit TolkResponse(TolkdAdaptation *adaptation) : mAdaptation(adaptation) {}
+    ~TolkResponse() override {}
+    android::hardware::Return<void> sendTolkResponse(const android::hardware::radio::V1_0::RadioResponseInfo &info,
+                                                     const android::hardware::hidl_vec<uint8_t> &data) override;
+
+private:
+    TolkdAdaptation *mAdaptation;
+};
+
+// Receives the modem's unsolicited output on a HIDL runtime thread.
+class TolkIndication : public vendor::orvane::hardware::radio::V2_0::ITolkIndication {
+public:
+    explicit TolkIndication(TolkdAdaptation *adaptation) : mAdaptation(adaptation) {}
+    ~TolkIndication() override {}
+    android::hardware::Return<void> tolkInd(android::hardware::radio::V1_0::RadioIndicationType type,
+                                            const android::hardware::hidl_vec<uint8_t> &data) override;
+
+private:
+    TolkdAdaptation *mAdaptation;
+};
+
+class RadioDeathRecipient : public android::hardware::hidl_death_recipient {
+public:
+    explicit RadioDeathRecipient(TolkdAdaptation *adaptation) : mAdaptation(adaptation) {}
+    ~RadioDeathRecipient() override {}
+    void serviceDied(uint64_t cookie, const android::wp<android::hidl::base::V1_0::IBase> &who) override;
+
+private:
+    TolkdAdaptation *mAdaptation;
+};
+
+class TolkdAdaptation {
+public:
+    TolkdAdaptation();
+
+    void setUp(int slot);
+    static int getSlotId();
+    bool sendRequest(const char *data, int length);
+    void sendResponse(const char *data, int length);
+    void serviceDied();
+    // Installs the bridge's end of a new modem pair and closes the previous end.
+    void setSocketFd(int fd);
+
+    android::sp<vendor::orvane::hardware::radio::V2_0::IRadio> mRadio[TOLKD_SIM_SLOT_COUNT];
+    android::sp<TolkResponse> mResponse;
+    android::sp<TolkIndication> mIndication;
+    android::sp<RadioDeathRecipient> mDeathRecipient;
+    int mSocketFd;
+    pthread_mutex_t mMutex;
+
+private:
+    TolkdAdaptation(const TolkdAdaptation &) = delete;
+    TolkdAdaptation &operator=(const TolkdAdaptation &) = delete;
+};
+
+// Created on first use, never destroyed.
+extern TolkdAdaptation *gTolkdAdaptation;
+
+#endif

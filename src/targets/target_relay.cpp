@@ -1,0 +1,209 @@
+// Sends forwarded commands to the generic service and the audio links, and relays
+// whatever a target answers to the host unchanged: one receive is one relay.
+#include "targets/target_relay.h"
+
+#include <errno.h>
+#include <string.h>
+#include <sys/select.h>
+#include <sys/socket.h>
+#include <sys/types.h>
+#include <unistd.h>
+
+#include "core/reader.h"
+#include "core/tolkd_log.h"
+#include "dispatch/dispatcher.h"
+#include "serial/response_writer.h"
+#include "serial/serial_device.h"
+#include "targets/mmi_queue.h"
+#include "targets/target_conn.h"
+
+bool isATCmdInject = false;
+
+static const char kUeNotReady[] = "ERROR:UE is not ready";
+
+static void closeLink(int *fd) {
+    int rc = close(*fd);
+    *fd = -1;
+    (void)rc;
+}
+
+// Receives into buf, retrying interrupted receives. Returns the byte count, 0 when
+// the peer shut the link down, -1 on failure (errno kept).
+static ssize_t receiveFromTarget(int fd, char *buf, size_t size) {
+    for (;;) {
+        ssize_t n = recv(fd, buf, size, 0);
+        if (n >= 0) return n;
+        if (errno != EINTR && errno != EAGAIN) return -1;
+    }
+}
+
+// Waits without time limit until fd is readable. Returns 1 when readable, 0 when
+// interrupted, -1 on failure. A descriptor select cannot watch counts as a failure.
+static int waitReadable(int fd) {
+    if (fd < 0 || fd >= FD_SETSIZE) {
+        errno = EBADF;
+        return -1;
+    }
+    fd_set rfds;
+    FD_ZERO(&rfds);
+    FD_SET(fd, &rfds);
+    int rc = select(fd + 1, &rfds, NULL, NULL, NULL);
+    if (rc > 0) return 1;
+    if (rc < 0 && errno != EINTR && errno != EAGAIN) return -1;
+    return 0;
+}
+
+int readDataFromTarget(int target, int *fd) {
+    if (fd == NULL) return -1;
+    char buf[DATA_BUF_SIZE];
+    LOGD("Read data from target:%d with fd:%d", target, *fd);
+    memset(buf, 0, sizeof(buf));
+
+    ssize_t n = receiveFromTarget(*fd, buf, MAX_DATA_LEN);
+    if (n < 0) {
+        LOGE("fail to receive data from target socket. errno = %d", errno);
+        closeLink(fd);
+        return -1;
+    }
+    if (n == 0) {
+        LOGD("The peer has performed an orderly shutdown, isATCmdInject %d", isATCmdInject);
+        closeLink(fd);
+        if (isATCmdInject) {
+            isATCmdInject = false;
+            return writeDataToSerial(kUeNotReady, (int)sizeof(kUeNotReady));
+        }
+        return 0;
+    }
+
+    if (target == RIL_TYPE) {
+        // Every receive counts as one modem answer, whatever it holds.
+        LOGD("Receive RIL rsp = [%d]", gMmiCmdSeq.idx);
+        gMmiCmdSeq.idx--;
+        if (mmiCmdSeqDeQueue()) sendCusMMICmdRspToMMI(buf);
+    }
+
+    isATCmdInject = false;
+    LOGD("data receive from %d is %s", target, buf);
+    LOGD("data receive data length is %d", (int)n);
+
+    int result = 0;
+    if (target == BELVO_AUDIO_TYPE) {
+        writeDataToSerialByAudioType(buf, (int)n);
+    } else {
+        result = writeDataToSerial(buf, (int)n);
+    }
+
+    if (isFinalResult(buf, (int)n)) isMsgCmdInput = false;
+    return result;
+}
+
+int readDataFromTargetWithResult(int target, int *fd, char *buf, int size) {
+    if (fd == NULL || buf == NULL || size < 2) return -1;
+    memset(buf, 0, (size_t)size);
+    // Keep the last byte for the NUL the callers rely on.
+    size_t want = (size_t)(size - 1) < (size_t)MAX_DATA_LEN ? (size_t)(size - 1) : (size_t)MAX_DATA_LEN;
+
+    ssize_t n = receiveFromTarget(*fd, buf, want);
+    if (n < 0) {
+        LOGE("fail to receive data from target socket. errno = %d", errno);
+        closeLink(fd);
+        return -1;
+    }
+    if (n == 0) {
+        LOGD("The peer has performed an orderly shutdown");
+        closeLink(fd);
+        return 0;
+    }
+    LOGD("data receive from %d is %s, data length is %d", target, buf, (int)n);
+    return writeDataToSerial(buf, (int)n);
+}
+
+void serviceReaderLoop(void) {
+    if (s_fdService_command == -1) return;
+    int rc = waitReadable(s_fdService_command);
+    if (rc < 0) {
+        LOGE("Fail to select in serviceReaderLoop. error: %d", errno);
+        closeLink(&s_fdService_command);
+        return;
+    }
+    if (rc == 0) return;
+    LOGD("Prepare read the data from generic service");
+    readDataFromTarget(GENERIC_TYPE, &s_fdService_command);
+}
+
+int serviceReaderLoopWithResult(const char *cmd) {
+    (void)cmd;
+    if (s_fdService_command == -1) return -1;
+    int rc = waitReadable(s_fdService_command);
+    if (rc < 0) {
+        LOGE("Fail to select in serviceReaderLoop. error: %d", errno);
+        closeLink(&s_fdService_command);
+        return -1;
+    }
+    if (rc == 0) return -1;
+    LOGD("Prepare read the data from generic service");
+    char buf[DATA_BUF_SIZE];
+    readDataFromTargetWithResult(GENERIC_TYPE, &s_fdService_command, buf, (int)sizeof(buf));
+    return strstr(buf, "OK") != NULL ? 1 : -1;
+}
+
+// The descriptor global of an audio target, or NULL for any other target.
+static int *audioLink(int target) {
+    switch (target) {
+    case AUDIO_TYPE:
+    case BELVO_AUDIO_TYPE:
+        return &s_fdAudio_command;
+    case AUDIO_EXT_TYPE:
+        return &s_fdAudioExt_command;
+    default:
+        return NULL;
+    }
+}
+
+void audioReaderLoop(int target) {
+    int *fd = audioLink(target);
+    if (fd == NULL) {
+        LOGD("invalid fd NULL");
+        return;
+    }
+    if (*fd < 0) {
+        LOGD("invalid fd [%d]", *fd);
+        return;
+    }
+    LOGD("valid fd [%d]", *fd);
+    int rc = waitReadable(*fd);
+    if (rc < 0) {
+        LOGE("Fail to select in audioReaderLoop. error: %d", errno);
+        closeLink(fd);
+        return;
+    }
+    if (rc == 0) return;
+    LOGD("Prepare read the data from audio driver");
+    readDataFromTarget(target, fd);
+}
+
+int sendDataToGenericService(const char *data) {
+    if (data == NULL) return 0;
+    size_t len = strlen(data);
+    // MSG_NOSIGNAL: a vanished service is a lost send, not a signal.
+    ssize_t n = send(s_fdService_command, data, len, MSG_NOSIGNAL);
+    if (n < 0 || (size_t)n < len) LOGE("lose data when send to generic service. errno = %d", errno);
+    return 0;
+}
+
+int sendDataToAudio(const char *data, int len, int target) {
+    int *fd = audioLink(target);
+    if (fd == NULL) {
+        LOGE("invalid audio data type.");
+        return 0;
+    }
+    if (*fd < 0) {
+        LOGE("invalid fd [%d].", *fd);
+        return 0;
+    }
+    if (data == NULL || len < 0) len = 0;
+    LOGD("sendDataToAudio - the data size of send to audio is: %d", len);
+    ssize_t n = send(*fd, data, (size_t)len, MSG_NOSIGNAL);
+    if (n < 0 || n < (ssize_t)len) LOGE("lose data when send to audio. errno = %d", errno);
+    return 0;
+}
