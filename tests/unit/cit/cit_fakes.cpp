@@ -1,0 +1,139 @@
+#include "cit_fakes.h"
+
+#include <errno.h>
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <stdexcept>
+
+#include <cutils/sockets.h>
+#include <tolk_platform/local_socket.h>
+
+#include "cit/cit_cmd.h"
+#include "serial/serial_device.h"
+
+HostLink::HostLink() {
+    int sv[2];
+    if (socketpair(AF_UNIX, SOCK_STREAM, 0, sv) != 0) throw std::runtime_error("socketpair");
+    host_ = sv[0];
+    device_ = sv[1];
+    gSerialDevice.fd[DEVICE_SERIAL] = device_;
+    gSerialDevice.currDevice = DEVICE_SERIAL;
+}
+
+HostLink::~HostLink() {
+    gSerialDevice.fd[DEVICE_SERIAL] = -1;
+    close(host_);
+    close(device_);
+}
+
+std::string HostLink::take() {
+    std::string out;
+    char buf[4096];
+    for (;;) {
+        ssize_t n = recv(host_, buf, sizeof(buf), MSG_DONTWAIT);
+        if (n <= 0) break;
+        out.append(buf, static_cast<size_t>(n));
+    }
+    return out;
+}
+
+FakeTestApp::FakeTestApp() {
+    listen_ = tolk_local_server(CIT_SOCKET_NAME, ANDROID_SOCKET_NAMESPACE_ABSTRACT, SOCK_STREAM, 4);
+    if (listen_ < 0) throw std::runtime_error("cannot serve the test application socket");
+    if (pipe(stop_) != 0) throw std::runtime_error("pipe");
+    thread_ = std::thread([this] { serve(); });
+}
+
+FakeTestApp::~FakeTestApp() {
+    char c = 'x';
+    (void)!write(stop_[1], &c, 1);
+    thread_.join();
+    close(listen_);
+    close(stop_[0]);
+    close(stop_[1]);
+}
+
+void FakeTestApp::reply(const std::string &word, const std::string &text) {
+    std::lock_guard<std::mutex> lock(mutex_);
+    replies_[word] = text;
+}
+
+void FakeTestApp::closeOn(const std::string &word) {
+    std::lock_guard<std::mutex> lock(mutex_);
+    closes_[word] = true;
+}
+
+std::vector<std::pair<int, std::string>> FakeTestApp::received() {
+    std::lock_guard<std::mutex> lock(mutex_);
+    return received_;
+}
+
+bool FakeTestApp::waitFor(size_t n) {
+    auto end = std::chrono::steady_clock::now() + std::chrono::seconds(5);
+    while (std::chrono::steady_clock::now() < end) {
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            if (received_.size() >= n) return true;
+        }
+        usleep(2000);
+    }
+    return false;
+}
+
+void FakeTestApp::serve() {
+    int id = 0;
+    for (;;) {
+        pollfd fds[2] = {{listen_, POLLIN, 0}, {stop_[0], POLLIN, 0}};
+        if (poll(fds, 2, -1) < 0) {
+            if (errno == EINTR) continue;
+            return;
+        }
+        if (fds[1].revents != 0) return;
+        int conn = accept(listen_, nullptr, nullptr);
+        if (conn < 0) continue;
+        bool stop = serveConnection(conn, ++id);
+        close(conn);
+        if (stop) return;
+    }
+}
+
+// Serves one connection until the daemon closes it; true when the test ends.
+bool FakeTestApp::serveConnection(int conn, int id) {
+    std::string pending;
+    for (;;) {
+        pollfd fds[2] = {{conn, POLLIN, 0}, {stop_[0], POLLIN, 0}};
+        if (poll(fds, 2, -1) < 0) {
+            if (errno == EINTR) continue;
+            return true;
+        }
+        if (fds[1].revents != 0) return true;
+        char buf[256];
+        ssize_t n = read(conn, buf, sizeof(buf));
+        if (n <= 0) return false;
+        pending.append(buf, static_cast<size_t>(n));
+        size_t nul;
+        while ((nul = pending.find('\0')) != std::string::npos) {
+            std::string word = pending.substr(0, nul);
+            pending.erase(0, nul + 1);
+            std::string text = "OK";
+            bool closeIt = false;
+            {
+                std::lock_guard<std::mutex> lock(mutex_);
+                received_.emplace_back(id, word);
+                if (replies_.count(word) != 0) text = replies_[word];
+                closeIt = closes_.count(word) != 0;
+            }
+            if (closeIt) return false;
+            (void)!send(conn, text.data(), text.size(), MSG_NOSIGNAL);
+        }
+    }
+}
+
+std::string framedVerdict(const std::string &text, bool ok) {
+    const std::string result = ok ? "OK" : "ERROR";
+    if (text.empty()) return "\r\n" + result + "\r\n";
+    return "\r\n" + text + "\r\n" + result + "\r\n";
+}

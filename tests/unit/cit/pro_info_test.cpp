@@ -1,0 +1,65 @@
+// Single flags of the product-information record through the NVRAM store.
+#include <gtest/gtest.h>
+
+#include <string>
+
+#include "cit/pro_info.h"
+#include "test_root.h"
+
+namespace {
+
+const char kStore[] = "/nvram/PRODUCT_INFO";
+
+TEST(ProInfo, SetThenGetChangesOnlyThatByte) {
+    TestRoot root;
+    std::string r(PRODUCT_INFO_SIZE, '\0');
+    for (size_t i = 0; i < r.size(); ++i) r[i] = static_cast<char>(i * 7);
+    root.write(kStore, r);
+
+    setFlag(0, 0xAB);
+    setFlag(FLAG_MMI1_RESULT, 1);
+    setFlag(PRODUCT_INFO_SIZE - 1, 0xFE);
+    EXPECT_EQ(0xAB, getFlag(0));
+    EXPECT_EQ(1, getFlag(FLAG_MMI1_RESULT));
+    EXPECT_EQ(0xFE, getFlag(PRODUCT_INFO_SIZE - 1));
+    EXPECT_EQ(static_cast<unsigned char>(5 * 7), getFlag(5)) << "values read back unsigned";
+
+    r[0] = '\xab';
+    r[FLAG_MMI1_RESULT] = 1;
+    r[PRODUCT_INFO_SIZE - 1] = '\xfe';
+    EXPECT_EQ(r, root.read(kStore));
+}
+
+TEST(ProInfo, UnusableStoreGivesFallbacksAndIsNeverWritten) {
+    TestRoot root;
+    EXPECT_EQ(0, getFlag(FLAG_MMI1_RESULT)) << "no store";
+    setFlag(FLAG_MMI1_RESULT, 1);
+    EXPECT_FALSE(root.exists(kStore));
+
+    const std::string twoRecords(2 * PRODUCT_INFO_SIZE, '\x01');
+    root.write(kStore, twoRecords);
+    EXPECT_EQ(255, getFlag(FLAG_MMI1_RESULT));
+    EXPECT_EQ(255, getFlag(0));
+    setFlag(FLAG_MMI1_RESULT, 0);
+    EXPECT_EQ(twoRecords, root.read(kStore));
+
+    // One record of the wrong size, declared through the store's shape file.
+    root.write(kStore, std::string(2048, '\x01'));
+    root.write("/nvram/PRODUCT_INFO.shape", "2048 1");
+    EXPECT_EQ(255, getFlag(0));
+    setFlag(0, 0);
+    EXPECT_EQ(std::string(2048, '\x01'), root.read(kStore));
+}
+
+TEST(ProInfo, IndexesOutsideTheRecordAreRefused) {
+    TestRoot root;
+    const std::string r(PRODUCT_INFO_SIZE, '\x11');
+    root.write(kStore, r);
+    for (int index : {-1, PRODUCT_INFO_SIZE, PRODUCT_INFO_SIZE + 1, -2147483647 - 1, 2147483647}) {
+        EXPECT_EQ(255, getFlag(index)) << index;
+        setFlag(index, 0x22);
+    }
+    EXPECT_EQ(r, root.read(kStore));
+}
+
+}  // namespace
