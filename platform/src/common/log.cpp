@@ -1,0 +1,218 @@
+// The Android log on the host: logcat "threadtime" lines written to a file or stderr.
+//
+// The filter is checked before anything is formatted, because debug lines are
+// frequent and normally filtered out. Callers come from the main thread and from
+// radio HAL callback threads alike, so all state sits behind one mutex and every
+// call ends in a single write() per destination, which keeps lines whole.
+#include <android/log.h>
+#include <tolk_platform/device_root.h>
+#include <tolk_platform/file_util.h>
+
+#include <ctype.h>
+#include <errno.h>
+#include <fcntl.h>
+#include <limits.h>
+#include <stdarg.h>
+#include <stdio.h>
+#include <stdlib.h>
+#include <string.h>
+#include <sys/syscall.h>
+#include <time.h>
+#include <unistd.h>
+
+#include <mutex>
+#include <string>
+#include <vector>
+
+namespace {
+
+constexpr size_t kMaxMessage = 8192;  // longer messages are cut
+constexpr size_t kMaxOutput = 16384;  // all lines of one message, headers included
+constexpr int kDefaultLevel = ANDROID_LOG_INFO;
+
+struct TagRule {
+    std::string tag;
+    int level;
+};
+
+struct LogState {
+    std::mutex mutex;
+    bool filterParsed = false;
+    std::string filterEnv;  // ANDROID_LOG_TAGS as last parsed
+    int defaultLevel = kDefaultLevel;
+    std::vector<TagRule> rules;
+    int fd = -1;            // the file destination; -1 for stderr
+    std::string destPath;   // what fd was opened for ("" = stderr)
+};
+
+LogState &state() {
+    static LogState *s = new LogState;  // never destroyed: threads may log during exit
+    return *s;
+}
+
+int level_of(char c) {
+    switch (tolower(static_cast<unsigned char>(c))) {
+    case 'v': return ANDROID_LOG_VERBOSE;
+    case 'd': return ANDROID_LOG_DEBUG;
+    case 'i': return ANDROID_LOG_INFO;
+    case 'w': return ANDROID_LOG_WARN;
+    case 'e': return ANDROID_LOG_ERROR;
+    case 'f': return ANDROID_LOG_FATAL;
+    case 's': return ANDROID_LOG_SILENT;
+    default: return -1;
+    }
+}
+
+// logcat filter syntax: blank-separated "TAG:LEVEL" items, "*" for every other tag,
+// a TAG without ":LEVEL" meaning verbose. Items with an unknown level are ignored.
+void parse_filter(LogState &s, const char *env) {
+    s.filterEnv = env != nullptr ? env : "";
+    s.defaultLevel = kDefaultLevel;
+    s.rules.clear();
+    const char *p = s.filterEnv.c_str();
+    while (*p != '\0') {
+        while (*p != '\0' && isspace(static_cast<unsigned char>(*p))) p++;
+        const char *start = p;
+        while (*p != '\0' && !isspace(static_cast<unsigned char>(*p))) p++;
+        if (p == start) break;
+        std::string item(start, p);
+        std::string tag = item;
+        int level = ANDROID_LOG_VERBOSE;
+        size_t colon = item.rfind(':');
+        if (colon != std::string::npos) {
+            tag = item.substr(0, colon);
+            std::string lv = item.substr(colon + 1);
+            level = lv.size() == 1 ? level_of(lv[0]) : -1;
+            if (level < 0) continue;
+        }
+        if (tag.empty()) continue;
+        if (tag == "*") s.defaultLevel = level;
+        else s.rules.push_back({tag, level});
+    }
+    s.filterParsed = true;
+}
+
+int min_level(LogState &s, const char *tag) {
+    const char *env = getenv("ANDROID_LOG_TAGS");
+    if (!s.filterParsed || s.filterEnv != (env != nullptr ? env : "")) parse_filter(s, env);
+    // The last rule for a tag wins, as when logcat applies them in order.
+    for (auto it = s.rules.rbegin(); it != s.rules.rend(); ++it)
+        if (it->tag == tag) return it->level;
+    return s.defaultLevel;
+}
+
+char prio_char(int prio) {
+    switch (prio) {
+    case ANDROID_LOG_VERBOSE: return 'V';
+    case ANDROID_LOG_DEBUG: return 'D';
+    case ANDROID_LOG_INFO: return 'I';
+    case ANDROID_LOG_WARN: return 'W';
+    case ANDROID_LOG_ERROR: return 'E';
+    case ANDROID_LOG_FATAL: return 'F';
+    default: return 'I';
+    }
+}
+
+// Where lines go now; "" means stderr.
+std::string destination() {
+    const char *file = getenv("TOLKD_LOG");
+    if (file != nullptr && file[0] != '\0') return file;
+    const char *root = tolk_device_root();
+    if (root != nullptr) return std::string(root) + "/log/tolkd.log";
+    return "";
+}
+
+// The descriptor for dest, reopened when the destination changed (tests move the
+// root between cases); -1 means stderr.
+int dest_fd(LogState &s, const std::string &dest) {
+    if (s.fd >= 0 && dest == s.destPath) return s.fd;
+    if (s.fd >= 0) close(s.fd);
+    s.fd = -1;
+    s.destPath = dest;
+    if (dest.empty()) return -1;
+    tolk_mkdirs_for(dest.c_str());
+    // openat, not open: inside the daemon open() is redirected under the root.
+    s.fd = openat(AT_FDCWD, dest.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
+    if (s.fd < 0) s.destPath.clear();
+    return s.fd;
+}
+
+void write_all(int fd, const char *p, size_t len) {
+    while (len > 0) {
+        ssize_t n = write(fd, p, len);
+        if (n < 0) {
+            if (errno == EINTR) continue;
+            return;
+        }
+        p += n;
+        len -= static_cast<size_t>(n);
+    }
+}
+
+}  // namespace
+
+extern "C" int __android_log_print(int prio, const char *tag, const char *fmt, ...) {
+    if (prio >= ANDROID_LOG_SILENT) return 0;
+    if (prio < ANDROID_LOG_VERBOSE) prio = ANDROID_LOG_INFO;
+    if (tag == nullptr) tag = "";
+    if (fmt == nullptr) fmt = "";
+    LogState &s = state();
+    {
+        std::lock_guard<std::mutex> lock(s.mutex);
+        if (prio < min_level(s, tag)) return 0;
+    }
+
+    int savedErrno = errno;  // callers log errno after the fact; keep it intact
+    char msg[kMaxMessage];
+    va_list ap;
+    va_start(ap, fmt);
+    int mlen = vsnprintf(msg, sizeof(msg), fmt, ap);
+    va_end(ap);
+    if (mlen < 0) mlen = 0;
+    size_t len = static_cast<size_t>(mlen) < sizeof(msg) ? static_cast<size_t>(mlen) : sizeof(msg) - 1;
+    while (len > 0 && (msg[len - 1] == '\n' || msg[len - 1] == '\r')) len--;
+    msg[len] = '\0';
+
+    // Host clock, read directly: time() and gettimeofday() are the simulated clock.
+    struct timespec ts;
+    clock_gettime(CLOCK_REALTIME, &ts);
+    struct tm tm;
+    gmtime_r(&ts.tv_sec, &tm);
+    char head[128];
+    int hlen = snprintf(head, sizeof(head), "%02d-%02d %02d:%02d:%02d.%03ld %5d %5ld %c %s: ", tm.tm_mon + 1,
+                        tm.tm_mday, tm.tm_hour, tm.tm_min, tm.tm_sec, ts.tv_nsec / 1000000L,
+                        static_cast<int>(getpid()), static_cast<long>(syscall(SYS_gettid)), prio_char(prio), tag);
+    if (hlen < 0) hlen = 0;
+    if (static_cast<size_t>(hlen) >= sizeof(head)) hlen = sizeof(head) - 1;
+
+    // Like logcat, every line of a multi-line message gets its own header.
+    static thread_local char out[kMaxOutput];
+    size_t olen = 0;
+    const char *line = msg;
+    for (;;) {
+        const char *nl = strchr(line, '\n');
+        size_t llen = nl != nullptr ? static_cast<size_t>(nl - line) : strlen(line);
+        if (olen + static_cast<size_t>(hlen) + 1 >= sizeof(out)) break;
+        memcpy(out + olen, head, static_cast<size_t>(hlen));
+        olen += static_cast<size_t>(hlen);
+        size_t room = sizeof(out) - olen - 1;
+        if (llen > room) llen = room;
+        memcpy(out + olen, line, llen);
+        olen += llen;
+        out[olen++] = '\n';
+        if (nl == nullptr) break;
+        line = nl + 1;
+    }
+
+    std::string dest = destination();
+    const char *toStderr = getenv("TOLKD_LOG_STDERR");
+    bool alsoStderr = toStderr != nullptr && strcmp(toStderr, "1") == 0;
+    {
+        std::lock_guard<std::mutex> lock(s.mutex);
+        int fd = dest_fd(s, dest);
+        if (fd >= 0) write_all(fd, out, olen);
+        if (fd < 0 || alsoStderr) write_all(STDERR_FILENO, out, olen);
+    }
+    errno = savedErrno;
+    return static_cast<int>(olen);
+}
