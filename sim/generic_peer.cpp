@@ -1,4 +1,158 @@
-// Placeholder until the generic peer exists: the process exits at once.
+// The simulated generic framework service on "tolk-service": it records every
+// message it receives and answers command texts from its script (a framed OK
+// by default). Answers may be held back or delayed per command; the service
+// keeps reading and answering other messages meanwhile, so a test can tell a
+// daemon that waits for one answer from one that does not.
+#include "modem_script.h"
 #include "peers.h"
 
-int run_generic_peer(const std::string &, const std::vector<std::string> &) { return 0; }
+#include <errno.h>
+#include <poll.h>
+#include <signal.h>
+#include <string.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdio>
+
+using namespace tolksim;
+
+namespace {
+
+const char kServicePath[] = "/dev/socket/tolk-service";
+const char kMmiMark[] = "+ORVTOLKJ";
+volatile sig_atomic_t gStop = 0;
+
+void onTerm(int) { gStop = 1; }
+
+struct Pending {
+    int fd;
+    long long due;
+    bool hold;
+    bool close;
+    std::string text;
+};
+
+class GenericService {
+public:
+    explicit GenericService(const std::string &root)
+        : root_(root), script_(root + "/sim/generic/script"), journal_(root + "/journal/generic.log") {}
+    int run();
+
+private:
+    void receive(int fd);
+    void dropClient(int fd);
+    void deliverDue();
+
+    std::string root_;
+    ScriptFile script_;
+    std::string journal_;
+    int listenFd_ = -1;
+    std::vector<int> clients_;
+    std::vector<Pending> pending_;
+};
+
+void GenericService::dropClient(int fd) {
+    close(fd);
+    clients_.erase(std::remove(clients_.begin(), clients_.end(), fd), clients_.end());
+    pending_.erase(std::remove_if(pending_.begin(), pending_.end(), [fd](const Pending &p) { return p.fd == fd; }),
+                   pending_.end());
+}
+
+void GenericService::receive(int fd) {
+    char buf[8192];
+    ssize_t n = read(fd, buf, sizeof buf);
+    if (n < 0 && errno == EINTR) return;
+    if (n <= 0) {
+        dropClient(fd);
+        return;
+    }
+    std::string msg(buf, static_cast<size_t>(n));
+    journalLine(journal_, visibleBytes(msg));
+
+    ScriptAnswer sa;
+    if (!script_.lookup(msg, &sa)) {
+        // MMI feedback ("command+ORVTOLKJ" + modem answer + ";") only informs the
+        // framework; everything else is a command that wants a final result.
+        if (msg.find(kMmiMark) != std::string::npos) return;
+        sa.frames.push_back("\r\nOK\r\n");
+    }
+    long long now = monoMs();
+    if (sa.close) {
+        pending_.push_back(Pending{fd, now + sa.delayMs, sa.hold, true, ""});
+        return;
+    }
+    for (size_t i = 0; i < sa.frames.size(); i++)
+        pending_.push_back(
+            Pending{fd, now + sa.delayMs + static_cast<long long>(i) * sa.gapMs, sa.hold, false, sa.frames[i]});
+}
+
+void GenericService::deliverDue() {
+    long long now = monoMs();
+    std::string release = root_ + "/sim/generic/release";
+    bool released = access(release.c_str(), F_OK) == 0;
+    if (released) unlink(release.c_str());
+    std::vector<Pending> due, keep;
+    for (Pending &p : pending_) ((p.due > now || (p.hold && !released)) ? keep : due).push_back(p);
+    pending_.swap(keep);
+    for (Pending &p : due) {
+        if (std::find(clients_.begin(), clients_.end(), p.fd) == clients_.end()) continue;
+        if (p.close || !sendAll(p.fd, p.text.data(), p.text.size())) dropClient(p.fd);
+    }
+}
+
+int GenericService::run() {
+    listenFd_ = listenUnix(underRoot(root_, kServicePath));
+    if (listenFd_ < 0) return 1;
+    while (!gStop) {
+        std::vector<struct pollfd> fds;
+        fds.push_back({listenFd_, POLLIN, 0});
+        for (int c : clients_) fds.push_back({c, POLLIN, 0});
+        int timeout = 100;
+        long long now = monoMs();
+        for (const Pending &p : pending_) {
+            if (p.hold) timeout = std::min(timeout, 20);
+            timeout = static_cast<int>(std::max(0LL, std::min<long long>(timeout, p.due - now)));
+        }
+        int r = poll(fds.data(), fds.size(), timeout);
+        if (r < 0 && errno != EINTR) break;
+        if (r > 0) {
+            if (fds[0].revents & POLLIN) {
+                int c = accept4(listenFd_, nullptr, nullptr, SOCK_CLOEXEC);
+                if (c >= 0) clients_.push_back(c);
+            }
+            for (size_t k = 1; k < fds.size(); k++) {
+                if (fds[k].revents & (POLLIN | POLLHUP | POLLERR)) {
+                    if (std::find(clients_.begin(), clients_.end(), fds[k].fd) != clients_.end()) receive(fds[k].fd);
+                }
+            }
+        }
+        deliverDue();
+    }
+    for (int c : std::vector<int>(clients_)) dropClient(c);
+    close(listenFd_);
+    unlink(underRoot(root_, kServicePath).c_str());
+    return 0;
+}
+
+}  // namespace
+
+int run_generic_peer(const std::string &root, const std::vector<std::string> &args) {
+    for (size_t i = 0; i < args.size(); i++) {
+        if (args[i] == "--root" && i + 1 < args.size()) {
+            ++i;
+        } else {
+            fprintf(stderr, "generic: unknown argument %s\n", args[i].c_str());
+            return 2;
+        }
+    }
+    struct sigaction sa;
+    memset(&sa, 0, sizeof sa);
+    sa.sa_handler = onTerm;
+    sigaction(SIGTERM, &sa, nullptr);
+    sigaction(SIGINT, &sa, nullptr);
+    signal(SIGPIPE, SIG_IGN);
+    GenericService service(root);
+    return service.run();
+}
