@@ -1,1 +1,361 @@
-int main() { return 0; }
+// tolk-sim: a simulated phone around tolkd, for development, demos and the
+// end-to-end tests. See `tolk-sim --help` and docs/SIMULATOR.md.
+#include <ftw.h>
+#include <stdlib.h>
+#include <unistd.h>
+
+#include <algorithm>
+#include <cstdio>
+#include <cstring>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include <cutils/properties.h>
+#include <tolk_platform/device_root.h>
+
+#include "peers.h"
+#include "sim_client.h"
+#include "sim_device.h"
+#include "sim_util.h"
+
+namespace {
+
+const char kUsage[] =
+    "tolk-sim: a simulated phone around the tolkd daemon.\n"
+    "\n"
+    "The device lives in a folder, the device root DIR: every absolute path the\n"
+    "daemon opens (/dev/ttyGS0, /sys/class/BOOT/BOOT/boot/boot_mode, /data/...) is\n"
+    "resolved under DIR, system properties are files in DIR/properties, shell\n"
+    "commands the daemon runs are only recorded in DIR/journal/shell.log, and the\n"
+    "clock it sets is a simulated one. A supervisor process holds the device:\n"
+    "  - the USB serial link: the daemon's port DIR/dev/ttyGS0 is wired to the\n"
+    "    host's port DIR/host/ttyACM0 (two pseudo-terminals and a relay);\n"
+    "  - the adb control socket DIR/dev/socket/adb_tolk_socket, handed to tolkd as\n"
+    "    init does; a host connects to it to send AT lines ended by CR;\n"
+    "  - the peer services tolkd forwards commands to: radio (the modem, through\n"
+    "    the radio HAL), generic (the framework service), audio, cit (the CIT test\n"
+    "    application); their logs are DIR/log/<name>.log;\n"
+    "  - tolkd itself, logging to DIR/log/tolkd.log.\n"
+    "\n"
+    "Quick start:  tolk-sim run            (a fresh device and a console on it)\n"
+    "\n"
+    "Commands (DIR is always given with --root DIR):\n"
+    "  up --root DIR [options]   prepare DIR, start the device and tolkd; returns\n"
+    "                            once tolkd is serving. Options:\n"
+    "      --prop NAME=VALUE       preset a system property (repeatable)\n"
+    "      --boot-mode TEXT        content of the boot mode file (default \"0\";\n"
+    "                              \"5\" is the engineering mode: tolkd exits)\n"
+    "      --no-boot-mode          no boot mode file at all\n"
+    "      --no-control-socket     no adb control socket\n"
+    "      --log-tags TAGS         ANDROID_LOG_TAGS for tolkd (default \"*:i\";\n"
+    "                              \"*:d\" shows debug lines)\n"
+    "      --adc CH=VALUE[,STATUS] a PMIC ADC channel reading (repeatable)\n"
+    "      --modem-tty PATH        the radio peer talks to a real modem there\n"
+    "      --nvram-shape SIZE,COUNT  PRODUCT_INFO of COUNT records of SIZE bytes\n"
+    "      --no-nvram              no PRODUCT_INFO store\n"
+    "      --tolkd PATH            the daemon binary to run\n"
+    "  down --root DIR           stop tolkd, the peers and the supervisor (DIR stays)\n"
+    "  at --root DIR [--adb] [--timeout SEC] [--quiet-ms MS] [--no-cr] LINE...\n"
+    "                            send each LINE (followed by CR) on the host serial\n"
+    "                            port, or on one adb connection, and print exactly\n"
+    "                            the bytes that come back. Escapes in LINE: \\r \\n\n"
+    "                            \\b \\e \\t \\0 \\\\ \\xNN. Each line ends at a final result\n"
+    "                            (OK, ERROR, +CME ERROR..., the SMS prompt...) or\n"
+    "                            after MS ms of silence (default 300).\n"
+    "  console --root DIR [--adb]  an interactive terminal on the link (Ctrl-] quits)\n"
+    "  run [up options] [--adb] [--keep]  up on a fresh folder (or --root DIR),\n"
+    "                            console, down. usermode is on unless --prop says.\n"
+    "  getprop --root DIR [NAME] print a property (all: \"[name]: [value]\" lines)\n"
+    "  setprop --root DIR NAME VALUE\n"
+    "  replug --root DIR         pull the USB cable and plug it in again at once\n"
+    "  unplug --root DIR         pull the USB cable for good\n"
+    "  tty-settings --root DIR   the daemon port's c_iflag, c_oflag, c_lflag, VERASE,\n"
+    "                            VEOL, VEOL2\n"
+    "  pause-host --root DIR MS  stop delivering device output to the host for MS ms\n"
+    "  stop|start --root DIR NAME  stop or restart a peer (radio generic audio cit)\n"
+    "  urc --root DIR [--slot N] TEXT  unsolicited modem output from SIM slot N\n"
+    "                            (default 1; escapes as for at)\n"
+    "  peer NAME --root DIR [ARGS]  run one peer in the foreground (the supervisor\n"
+    "                            does this)\n"
+    "\n"
+    "DIR/sim.env holds TOLKD_ROOT, TOLKD_PID, TOLK_SIM_PID, TOLK_HOST_TTY,\n"
+    "TOLK_ADB_SOCKET and TOLKD_LOG in shell syntax (`. DIR/sim.env`).\n";
+
+struct Args {
+    std::string root;
+    std::vector<std::string> rest;  // everything else, in order
+};
+
+// Pulls --root DIR out of the arguments after the subcommand.
+bool splitRoot(const std::vector<std::string> &in, size_t from, Args *a) {
+    for (size_t i = from; i < in.size(); i++) {
+        if (in[i] == "--root") {
+            if (i + 1 >= in.size()) return false;
+            a->root = in[++i];
+        } else {
+            a->rest.push_back(in[i]);
+        }
+    }
+    return true;
+}
+
+bool resolveRoot(const std::string &cmd, std::string *root) {
+    if (root->empty()) {
+        fprintf(stderr, "tolk-sim %s: --root DIR is required\n", cmd.c_str());
+        return false;
+    }
+    char real[4096];
+    if (!realpath(root->c_str(), real)) {
+        fprintf(stderr, "tolk-sim %s: no device root at %s\n", cmd.c_str(), root->c_str());
+        return false;
+    }
+    *root = real;
+    setenv(TOLKD_ROOT_ENV, real, 1);
+    return true;
+}
+
+// Runs one command of the supervisor and prints its data lines.
+int control(const std::string &root, const std::string &command) {
+    std::string answer;
+    if (!sim::controlRequest(root, command, &answer)) {
+        fprintf(stderr, "tolk-sim: no simulated device is up on %s\n", root.c_str());
+        return 1;
+    }
+    size_t nl = answer.find('\n');
+    std::string head = answer.substr(0, nl);
+    std::string data = nl == std::string::npos ? "" : answer.substr(nl + 1);
+    if (head != "ok") {
+        fprintf(stderr, "tolk-sim: %s\n", head.c_str());
+        return 1;
+    }
+    fputs(data.c_str(), stdout);
+    return 0;
+}
+
+int removeEntry(const char *path, const struct stat *, int, struct FTW *) { return remove(path); }
+
+int cmdRun(const std::vector<std::string> &argv) {
+    sim::UpOptions opt;
+    std::string err;
+    std::vector<std::string> extra;
+    if (!sim::parseUpOptions(argv, 2, &opt, &err, &extra)) {
+        fprintf(stderr, "tolk-sim run: %s\n", err.c_str());
+        return 2;
+    }
+    bool adb = false, keep = false;
+    for (const auto &e : extra) {
+        if (e == "--adb")
+            adb = true;
+        else if (e == "--keep")
+            keep = true;
+        else {
+            fprintf(stderr, "tolk-sim run: unknown option '%s'\n", e.c_str());
+            return 2;
+        }
+    }
+    bool temporary = false;
+    if (opt.root.empty()) {
+        char tmpl[] = "/tmp/tolk-sim.XXXXXX";
+        if (!mkdtemp(tmpl)) {
+            perror("tolk-sim run: mkdtemp");
+            return 1;
+        }
+        opt.root = tmpl;
+        temporary = true;
+    }
+    bool userModeGiven = false;
+    for (const auto &p : opt.props)
+        if (p.first == "persist.service.tolk.usermode") userModeGiven = true;
+    // A demo wants modem commands through on a "user" build.
+    if (!userModeGiven) opt.props.emplace_back("persist.service.tolk.usermode", "1");
+    opt.quiet = true;
+    int rc = sim::cmdUp(opt);
+    if (rc == 0) {
+        char real[4096];
+        std::string root = realpath(opt.root.c_str(), real) ? real : opt.root;
+        sim::RootLayout L{root};
+        printf("tolkd is serving on the simulated device %s\n", root.c_str());
+        printf("  host serial port: %s\n", L.hostTty().c_str());
+        printf("  adb socket:       %s\n", opt.controlSocket ? L.adbSocket().c_str() : "(none)");
+        printf("  tolkd log:        %s\n", L.tolkdLog().c_str());
+        printf("  peers' logs:      %s/log/\n", root.c_str());
+        fflush(stdout);
+        rc = sim::cmdConsole(root, adb);
+    }
+    sim::cmdDown(opt.root);
+    if (temporary && !keep) {
+        nftw(opt.root.c_str(), removeEntry, 16, FTW_DEPTH | FTW_PHYS);
+    } else {
+        printf("the device root stays at %s\n", opt.root.c_str());
+    }
+    return rc;
+}
+
+int cmdAt(const Args &a) {
+    sim::AtOptions opt;
+    opt.root = a.root;
+    bool onlyLines = false;
+    for (size_t i = 0; i < a.rest.size(); i++) {
+        const std::string &s = a.rest[i];
+        if (!onlyLines && s == "--") {
+            onlyLines = true;
+        } else if (!onlyLines && s == "--adb") {
+            opt.adb = true;
+        } else if (!onlyLines && s == "--no-cr") {
+            opt.noCr = true;
+        } else if (!onlyLines && (s == "--timeout" || s == "--quiet-ms")) {
+            if (i + 1 >= a.rest.size()) {
+                fprintf(stderr, "tolk-sim at: %s needs a number\n", s.c_str());
+                return 2;
+            }
+            int v = atoi(a.rest[++i].c_str());
+            if (v <= 0) {
+                fprintf(stderr, "tolk-sim at: %s needs a positive number\n", s.c_str());
+                return 2;
+            }
+            (s == "--timeout" ? opt.timeoutSec : opt.quietMs) = v;
+        } else {
+            opt.lines.push_back(s);
+        }
+    }
+    if (opt.lines.empty()) {
+        fprintf(stderr, "tolk-sim at: no LINE to send\n");
+        return 2;
+    }
+    return sim::cmdAt(opt);
+}
+
+void collectProp(const char *key, const char *value, void *cookie) {
+    static_cast<std::vector<std::pair<std::string, std::string>> *>(cookie)->emplace_back(key, value);
+}
+
+int dispatch(const std::vector<std::string> &argv) {
+    if (argv.size() < 2 || argv[1] == "--help" || argv[1] == "-h" || argv[1] == "help") {
+        fputs(kUsage, argv.size() < 2 ? stderr : stdout);
+        return argv.size() < 2 ? 2 : 0;
+    }
+    const std::string &cmd = argv[1];
+    if (cmd == "up") {
+        sim::UpOptions opt;
+        std::string err;
+        if (!sim::parseUpOptions(argv, 2, &opt, &err)) {
+            fprintf(stderr, "tolk-sim up: %s\n", err.c_str());
+            return 2;
+        }
+        return sim::cmdUp(opt);
+    }
+    if (cmd == "run") return cmdRun(argv);
+    if (cmd == "peer") {
+        if (argv.size() < 3 || !sim::isPeerName(argv[2])) {
+            fprintf(stderr, "tolk-sim peer: NAME is one of radio, generic, audio, cit\n");
+            return 2;
+        }
+        Args a;
+        if (!splitRoot(argv, 3, &a) || !resolveRoot("peer", &a.root)) return 2;
+        const std::string &name = argv[2];
+        if (name == "radio") return run_radio_peer(a.root, a.rest);
+        if (name == "generic") return run_generic_peer(a.root, a.rest);
+        if (name == "audio") return run_audio_peer(a.root, a.rest);
+        return run_cit_peer(a.root, a.rest);
+    }
+
+    Args a;
+    if (!splitRoot(argv, 2, &a)) {
+        fprintf(stderr, "tolk-sim %s: --root needs a folder\n", cmd.c_str());
+        return 2;
+    }
+    if (cmd == "down") {
+        if (a.root.empty()) {
+            fprintf(stderr, "tolk-sim down: --root DIR is required\n");
+            return 2;
+        }
+        return sim::cmdDown(a.root);
+    }
+    if (!resolveRoot(cmd, &a.root)) return 2;
+    if (cmd == "at") return cmdAt(a);
+    if (cmd == "console") {
+        bool adb = std::find(a.rest.begin(), a.rest.end(), "--adb") != a.rest.end();
+        return sim::cmdConsole(a.root, adb);
+    }
+    if (cmd == "getprop") {
+        if (a.rest.size() > 1) {
+            fprintf(stderr, "tolk-sim getprop: at most one NAME\n");
+            return 2;
+        }
+        if (a.rest.size() == 1) {
+            char value[PROP_VALUE_MAX];
+            property_get(a.rest[0].c_str(), value, "");
+            printf("%s\n", value);
+            return 0;
+        }
+        std::vector<std::pair<std::string, std::string>> all;
+        property_list(collectProp, &all);
+        std::sort(all.begin(), all.end());
+        for (const auto &p : all) printf("[%s]: [%s]\n", p.first.c_str(), p.second.c_str());
+        return 0;
+    }
+    if (cmd == "setprop") {
+        if (a.rest.size() != 2) {
+            fprintf(stderr, "tolk-sim setprop: NAME VALUE\n");
+            return 2;
+        }
+        if (property_set(a.rest[0].c_str(), a.rest[1].c_str()) != 0) {
+            fprintf(stderr, "tolk-sim setprop: %s=%s was refused\n", a.rest[0].c_str(), a.rest[1].c_str());
+            return 1;
+        }
+        return 0;
+    }
+    if (cmd == "replug" || cmd == "unplug" || cmd == "tty-settings") {
+        if (!a.rest.empty()) {
+            fprintf(stderr, "tolk-sim %s: unexpected argument '%s'\n", cmd.c_str(), a.rest[0].c_str());
+            return 2;
+        }
+        return control(a.root, cmd);
+    }
+    if (cmd == "pause-host") {
+        if (a.rest.size() != 1) {
+            fprintf(stderr, "tolk-sim pause-host: MS\n");
+            return 2;
+        }
+        return control(a.root, "pause-host " + a.rest[0]);
+    }
+    if (cmd == "stop" || cmd == "start") {
+        if (a.rest.size() != 1 || !sim::isPeerName(a.rest[0])) {
+            fprintf(stderr, "tolk-sim %s: NAME is one of radio, generic, audio, cit\n", cmd.c_str());
+            return 2;
+        }
+        return control(a.root, cmd + " " + a.rest[0]);
+    }
+    if (cmd == "urc") {
+        int slot = 1;
+        std::string text;
+        bool haveText = false;
+        for (size_t i = 0; i < a.rest.size(); i++) {
+            if (a.rest[i] == "--slot" && i + 1 < a.rest.size()) {
+                slot = atoi(a.rest[++i].c_str());
+            } else if (!haveText) {
+                text = a.rest[i];
+                haveText = true;
+            } else {
+                fprintf(stderr, "tolk-sim urc: one TEXT only (quote it)\n");
+                return 2;
+            }
+        }
+        std::string bytes, err;
+        if (!haveText || !sim::decodeEscapes(text, &bytes, &err)) {
+            fprintf(stderr, "tolk-sim urc: %s\n", haveText ? err.c_str() : "TEXT is missing");
+            return 2;
+        }
+        return send_radio_urc(a.root, slot, bytes);
+    }
+    fprintf(stderr, "tolk-sim: unknown command '%s' (tolk-sim --help)\n", cmd.c_str());
+    return 2;
+}
+
+}  // namespace
+
+int main(int argc, char **argv) {
+    std::vector<std::string> args(argv, argv + argc);
+    return dispatch(args);
+}

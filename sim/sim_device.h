@@ -1,0 +1,42 @@
+// `tolk-sim up` and the supervisor it leaves behind: the simulated device around
+// one tolkd process.
+#ifndef TOLK_SIM_DEVICE_H
+#define TOLK_SIM_DEVICE_H
+
+#include <string>
+#include <utility>
+#include <vector>
+
+namespace sim {
+
+struct UpOptions {
+    std::string root;
+    std::vector<std::pair<std::string, std::string>> props;
+    bool writeBootMode = true;
+    std::string bootMode = "0";
+    bool controlSocket = true;
+    std::string logTags = "*:i";
+    std::vector<std::string> adcLines;  // "CHANNEL VALUE STATUS"
+    std::string modemTty;
+    bool nvram = true;
+    bool nvramShapeGiven = false;
+    long nvramSize = 1024;
+    long nvramCount = 1;
+    std::string tolkdBinary;
+    bool quiet = false;  // no success summary on stdout
+};
+
+// Parses the options of `up` (and of `run`, which shares them) starting at args[i].
+// Unknown options are errors unless extra is given, in which case they are
+// appended to it. Returns false with a message in err.
+bool parseUpOptions(const std::vector<std::string> &args, size_t i, UpOptions *opt, std::string *err,
+                    std::vector<std::string> *extra = nullptr);
+
+// Brings the device up; returns the process exit status of `up`.
+int cmdUp(UpOptions opt);
+// Stops everything started for root; idempotent. Returns 0 when nothing is left.
+int cmdDown(const std::string &root);
+
+}  // namespace sim
+
+#endif

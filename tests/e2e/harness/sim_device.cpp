@@ -1,0 +1,321 @@
+#include "sim_device.h"
+
+#include <dirent.h>
+#include <errno.h>
+#include <fcntl.h>
+#include <ftw.h>
+#include <poll.h>
+#include <signal.h>
+#include <stdlib.h>
+#include <sys/socket.h>
+#include <sys/stat.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+#include <termios.h>
+#include <time.h>
+#include <unistd.h>
+
+#include <cstdio>
+#include <cstring>
+#include <fstream>
+#include <sstream>
+
+#include <gtest/gtest.h>
+
+namespace {
+
+long long monoMs() {
+    struct timespec ts;
+    clock_gettime(CLOCK_MONOTONIC, &ts);
+    return static_cast<long long>(ts.tv_sec) * 1000 + ts.tv_nsec / 1000000;
+}
+
+void sleepMs(int ms) {
+    struct timespec ts = {ms / 1000, (ms % 1000) * 1000000L};
+    while (nanosleep(&ts, &ts) != 0 && errno == EINTR) {
+    }
+}
+
+int removeEntry(const char *path, const struct stat *, int, struct FTW *) { return remove(path); }
+
+void mkdirs(const std::string &path) {
+    for (size_t pos = path.find('/', 1); ; pos = path.find('/', pos + 1)) {
+        mkdir(path.substr(0, pos).c_str(), 0755);
+        if (pos == std::string::npos) break;
+    }
+}
+
+}  // namespace
+
+int runSim(const std::vector<std::string> &args, std::string *out, bool errToo) {
+    int pfd[2];
+    if (pipe2(pfd, O_CLOEXEC) != 0) return -1;
+    pid_t pid = fork();
+    if (pid < 0) return -1;
+    if (pid == 0) {
+        dup2(pfd[1], 1);
+        if (errToo) dup2(pfd[1], 2);
+        std::vector<char *> argv;
+        argv.push_back(const_cast<char *>(TOLK_SIM_BINARY));
+        for (const auto &a : args) argv.push_back(const_cast<char *>(a.c_str()));
+        argv.push_back(nullptr);
+        execv(TOLK_SIM_BINARY, argv.data());
+        _exit(127);
+    }
+    close(pfd[1]);
+    std::string collected;
+    char buf[8192];
+    for (;;) {
+        ssize_t n = read(pfd[0], buf, sizeof buf);
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0) break;
+        collected.append(buf, static_cast<size_t>(n));
+    }
+    close(pfd[0]);
+    int status = 0;
+    while (waitpid(pid, &status, 0) < 0 && errno == EINTR) {
+    }
+    if (out) *out = collected;
+    if (WIFEXITED(status)) return WEXITSTATUS(status);
+    return 128 + (WIFSIGNALED(status) ? WTERMSIG(status) : 0);
+}
+
+SimDevice::SimDevice(const std::vector<std::string> &upArgs) {
+    // Short: the sockets under the root must fit into 108 bytes.
+    char tmpl[] = "/tmp/tsXXXXXX";
+    if (!mkdtemp(tmpl)) {
+        ADD_FAILURE() << "mkdtemp: " << strerror(errno);
+        return;
+    }
+    root_ = tmpl;
+    std::vector<std::string> args = {"up", "--root", root_, "--tolkd", TOLKD_BINARY};
+    args.insert(args.end(), upArgs.begin(), upArgs.end());
+    upStatus_ = runSim(args, &upOutput_, true);
+}
+
+SimDevice::~SimDevice() {
+    if (root_.empty()) return;
+    runSim({"down", "--root", root_});
+    const ::testing::TestInfo *info = ::testing::UnitTest::GetInstance()->current_test_info();
+    bool failed = info && info->result() && info->result()->Failed();
+    if (failed) {
+        std::string tail = log();
+        if (tail.size() > 6000) tail = "..." + tail.substr(tail.size() - 6000);
+        fprintf(stderr, "---- tolkd log of %s ----\n%s---- end of log ----\n", root_.c_str(), tail.c_str());
+    }
+    const char *keep = getenv("TOLK_E2E_KEEP");
+    if (keep && *keep && strcmp(keep, "0") != 0) {
+        fprintf(stderr, "device root kept: %s\n", root_.c_str());
+        return;
+    }
+    nftw(root_.c_str(), removeEntry, 16, FTW_DEPTH | FTW_PHYS);
+}
+
+std::string SimDevice::at(const std::vector<std::string> &lines, bool adb, int quietMs) {
+    std::vector<std::string> args = {"at", "--root", root_, "--quiet-ms", std::to_string(quietMs),
+                                     "--timeout", "30"};
+    if (adb) args.push_back("--adb");
+    args.push_back("--");
+    args.insert(args.end(), lines.begin(), lines.end());
+    std::string out;
+    runSim(args, &out);
+    return out;
+}
+
+std::string SimDevice::sim(const std::vector<std::string> &args, int *status) {
+    std::vector<std::string> full;
+    if (!args.empty()) full.push_back(args[0]);
+    full.push_back("--root");
+    full.push_back(root_);
+    full.insert(full.end(), args.begin() + (args.empty() ? 0 : 1), args.end());
+    std::string out;
+    int rc = runSim(full, &out);
+    if (status) *status = rc;
+    return out;
+}
+
+std::string SimDevice::getprop(const std::string &name) {
+    std::string out = sim({"getprop", name});
+    if (!out.empty() && out.back() == '\n') out.pop_back();
+    return out;
+}
+
+void SimDevice::setprop(const std::string &name, const std::string &value) {
+    int status = 0;
+    sim({"setprop", name, value}, &status);
+    EXPECT_EQ(0, status) << "setprop " << name << "=" << value << " refused";
+}
+
+std::string SimDevice::readFile(const std::string &devicePath) const {
+    std::ifstream in(root_ + devicePath, std::ios::binary);
+    std::ostringstream ss;
+    ss << in.rdbuf();
+    return ss.str();
+}
+
+void SimDevice::writeFile(const std::string &devicePath, const std::string &content) const {
+    std::string path = root_ + devicePath;
+    mkdirs(path.substr(0, path.rfind('/')));
+    std::ofstream out(path, std::ios::binary | std::ios::trunc);
+    out << content;
+}
+
+bool SimDevice::fileExists(const std::string &devicePath) const {
+    struct stat st;
+    return lstat((root_ + devicePath).c_str(), &st) == 0;
+}
+
+std::string SimDevice::log() const { return readFile("/log/tolkd.log"); }
+
+std::string SimDevice::env(const std::string &key) const {
+    std::istringstream in(readFile("/sim.env"));
+    std::string line;
+    while (std::getline(in, line)) {
+        if (line.compare(0, key.size() + 1, key + "=") != 0) continue;
+        std::string v = line.substr(key.size() + 1);
+        // Values are single-quoted shell words ('\'' for a quote).
+        std::string out;
+        bool quoted = false;
+        for (size_t i = 0; i < v.size(); i++) {
+            if (v[i] == '\'') {
+                quoted = !quoted;
+            } else if (!quoted && v[i] == '\\' && i + 1 < v.size()) {
+                out.push_back(v[++i]);
+            } else {
+                out.push_back(v[i]);
+            }
+        }
+        return out;
+    }
+    return "";
+}
+
+pid_t SimDevice::tolkdPid() const { return static_cast<pid_t>(atol(env("TOLKD_PID").c_str())); }
+
+int SimDevice::tolkdExitStatus(int timeoutMs) const {
+    long long deadline = monoMs() + timeoutMs;
+    for (;;) {
+        std::string s = readFile("/run/tolkd.status");
+        if (!s.empty()) {
+            if (s.compare(0, 7, "signal ") == 0) return 128 + atoi(s.c_str() + 7);
+            return atoi(s.c_str());
+        }
+        if (monoMs() >= deadline) return -1;
+        sleepMs(10);
+    }
+}
+
+int SimDevice::tolkdFdCount() const {
+    pid_t pid = tolkdPid();
+    if (pid <= 0) return -1;
+    DIR *d = opendir(("/proc/" + std::to_string(pid) + "/fd").c_str());
+    if (!d) return -1;
+    int n = 0;
+    while (struct dirent *e = readdir(d))
+        if (e->d_name[0] != '.') n++;
+    closedir(d);
+    return n;
+}
+
+int SimDevice::openSerial() const {
+    int fd = open((root_ + "/host/ttyACM0").c_str(), O_RDWR | O_NOCTTY | O_CLOEXEC);
+    if (fd < 0) return -1;
+    struct termios t;
+    if (tcgetattr(fd, &t) == 0) {
+        cfmakeraw(&t);
+        tcsetattr(fd, TCSANOW, &t);
+    }
+    tcflush(fd, TCIFLUSH);
+    return fd;
+}
+
+int SimDevice::connectAdb() const {
+    std::string path = root_ + "/dev/socket/adb_tolk_socket";
+    struct sockaddr_un addr;
+    memset(&addr, 0, sizeof addr);
+    addr.sun_family = AF_UNIX;
+    if (path.size() >= sizeof addr.sun_path) return -1;
+    memcpy(addr.sun_path, path.c_str(), path.size());
+    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    if (fd < 0) return -1;
+    if (connect(fd, reinterpret_cast<struct sockaddr *>(&addr), sizeof addr) != 0) {
+        close(fd);
+        return -1;
+    }
+    return fd;
+}
+
+bool writeAll(int fd, const std::string &data) {
+    size_t done = 0;
+    while (done < data.size()) {
+        ssize_t n = write(fd, data.data() + done, data.size() - done);
+        if (n < 0 && errno == EINTR) continue;
+        if (n < 0 && errno == EAGAIN) {
+            struct pollfd p = {fd, POLLOUT, 0};
+            poll(&p, 1, 1000);
+            continue;
+        }
+        if (n <= 0) return false;
+        done += static_cast<size_t>(n);
+    }
+    return true;
+}
+
+namespace {
+
+// Reads whatever arrives until stop() says enough, nothing arrives for quietMs
+// (quietMs < 0: no quiet rule) or totalMs has passed.
+template <typename Stop>
+std::string readLoop(int fd, int quietMs, int totalMs, Stop stop) {
+    std::string got;
+    long long deadline = monoMs() + totalMs;
+    char buf[8192];
+    for (;;) {
+        long long left = deadline - monoMs();
+        if (left <= 0) break;
+        int wait = quietMs >= 0 && quietMs < left ? quietMs : static_cast<int>(left);
+        struct pollfd p = {fd, POLLIN, 0};
+        int r = poll(&p, 1, wait);
+        if (r < 0 && errno == EINTR) continue;
+        if (r <= 0) {
+            if (quietMs >= 0) break;
+            continue;
+        }
+        ssize_t n = read(fd, buf, sizeof buf);
+        if (n < 0 && (errno == EINTR || errno == EAGAIN)) continue;
+        if (n <= 0) break;
+        got.append(buf, static_cast<size_t>(n));
+        if (stop(got)) break;
+    }
+    return got;
+}
+
+}  // namespace
+
+std::string readQuiet(int fd, int quietMs, int totalMs) {
+    return readLoop(fd, quietMs, totalMs, [](const std::string &) { return false; });
+}
+
+std::string readUntil(int fd, const std::string &needle, int timeoutMs) {
+    return readLoop(fd, -1, timeoutMs,
+                    [&](const std::string &got) { return got.find(needle) != std::string::npos; });
+}
+
+std::string visible(const std::string &bytes) {
+    std::string out;
+    char tmp[8];
+    for (unsigned char c : bytes) {
+        if (c == '\r')
+            out += "\\r";
+        else if (c == '\n')
+            out += "\\n";
+        else if (c == '\\')
+            out += "\\\\";
+        else if (c < 0x20 || c >= 0x7f) {
+            snprintf(tmp, sizeof tmp, "\\x%02x", c);
+            out += tmp;
+        } else
+            out.push_back(static_cast<char>(c));
+    }
+    return out;
+}
