@@ -1,0 +1,109 @@
+// AT+ESUO on single, dual and triple SIM devices and in C2K mode.
+#include <cutils/properties.h>
+#include <gtest/gtest.h>
+
+#include <cstring>
+
+#include <string>
+
+#include "../dispatch/host_capture.h"
+#include "attok/at_tok.h"
+#include "dispatch/dispatcher.h"
+#include "handlers/handlers.h"
+#include "test_root.h"
+
+namespace {
+
+class SimSelectTest : public ::testing::Test {
+protected:
+    int esuo(const char *param, int op) {
+        std::memset(response, 0, sizeof(response));
+        return pas_esuo_handler(param, op, response);
+    }
+    std::string sim() {
+        char value[PROPERTY_VALUE_MAX];
+        property_get("persist.service.tolk.sim", value, "(unset)");
+        return value;
+    }
+    void multiSim(const char *config) { ASSERT_EQ(0, property_set("persist.radio.multisim.config", config)); }
+
+    TestRoot root;
+    HostCapture host;
+    char response[RESPONSE_BUF_SIZE];
+};
+
+TEST_F(SimSelectTest, DualSimIsTheDefault) {
+    EXPECT_EQ(0, esuo("5", AT_SET_OP));
+    EXPECT_EQ("1", sim());
+    EXPECT_EQ(0, esuo("", AT_READ_OP));
+    EXPECT_STREQ("+ESUO:5\r\n", response);
+    EXPECT_EQ(4, esuo("6", AT_SET_OP));
+    EXPECT_EQ(4, esuo("9", AT_SET_OP));
+    EXPECT_EQ(4, esuo("7", AT_SET_OP)) << "7 is only ever reported";
+    EXPECT_EQ(4, esuo("0", AT_SET_OP));
+    EXPECT_EQ(-1, esuo("abc", AT_SET_OP));
+    EXPECT_EQ("1", sim()) << "refused values leave the slot";
+    EXPECT_EQ(0, esuo("4", AT_SET_OP));
+    EXPECT_EQ("0", sim());
+
+    EXPECT_EQ(0, esuo("", AT_TEST_OP));
+    EXPECT_STREQ("", response);
+    EXPECT_EQ("\r\n+ESUO: (4-5)\r\n", host.take());
+}
+
+TEST_F(SimSelectTest, SingleAndTripleSim) {
+    multiSim("ss");
+    EXPECT_EQ(4, esuo("5", AT_SET_OP));
+    EXPECT_EQ("(unset)", sim());
+    EXPECT_EQ(0, esuo("4", AT_SET_OP));
+    EXPECT_EQ("0", sim());
+    EXPECT_EQ(0, esuo("", AT_TEST_OP));
+    EXPECT_EQ("\r\n+ESUO: (4)\r\n", host.take());
+
+    multiSim("tsts");
+    EXPECT_EQ(0, esuo("6", AT_SET_OP));
+    EXPECT_EQ("2", sim());
+    EXPECT_EQ(0, esuo("", AT_READ_OP));
+    EXPECT_STREQ("+ESUO:6\r\n", response);
+    EXPECT_EQ(0, esuo("5", AT_SET_OP));
+    EXPECT_EQ("1", sim());
+    EXPECT_EQ(0, esuo("", AT_TEST_OP));
+    EXPECT_EQ("\r\n+ESUO: (4-6)\r\n", host.take());
+}
+
+TEST_F(SimSelectTest, C2kModeSelectsTheThirdModemInsteadOfSim3) {
+    multiSim("tsts");
+    ASSERT_EQ(0, property_set("ro.boot.opt_c2k_lte_mode", "1"));
+    EXPECT_EQ(0, esuo("9", AT_SET_OP));
+    EXPECT_EQ("9", sim());
+    EXPECT_EQ(0, esuo("", AT_READ_OP));
+    EXPECT_STREQ("+ESUO:9\r\n", response);
+    EXPECT_EQ(4, esuo("6", AT_SET_OP)) << "no SIM 3 in C2K mode, even on a triple-SIM device";
+    EXPECT_EQ("9", sim());
+    EXPECT_EQ(0, esuo("5", AT_SET_OP));
+    EXPECT_EQ("1", sim());
+    EXPECT_EQ(0, esuo("4", AT_SET_OP));
+    EXPECT_EQ("0", sim());
+    EXPECT_EQ(-1, esuo("x", AT_SET_OP));
+    // The test answer does not look at C2K mode.
+    EXPECT_EQ(0, esuo("", AT_TEST_OP));
+    EXPECT_EQ("\r\n+ESUO: (4-6)\r\n", host.take());
+}
+
+TEST_F(SimSelectTest, ReadMapsEveryStoredValue) {
+    struct {
+        const char *stored;
+        const char *answer;
+    } cases[] = {
+        {"0", "+ESUO:4\r\n"}, {"1", "+ESUO:5\r\n"}, {"2", "+ESUO:6\r\n"},
+        {"3", "+ESUO:7\r\n"}, {"9", "+ESUO:9\r\n"}, {"5", "+ESUO:Value unsupport\r\n"},
+        {"x", "+ESUO:4\r\n"}, {"-1", "+ESUO:Value unsupport\r\n"},
+    };
+    for (const auto &c : cases) {
+        ASSERT_EQ(0, property_set("persist.service.tolk.sim", c.stored));
+        EXPECT_EQ(0, esuo("", AT_READ_OP));
+        EXPECT_STREQ(c.answer, response) << c.stored;
+    }
+}
+
+}  // namespace
