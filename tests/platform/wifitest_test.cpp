@@ -60,4 +60,13 @@ TEST(WifiTest, ControlFileSteersAnswers) {
     EXPECT_TRUE(WIFI_TEST_GetResult(&first, &second));
     EXPECT_EQ(first, 200);
     EXPECT_EQ(second, 9);
+
+    // Another device root has its own chip: nothing cleared there yet.
+    root.write("/wifitest/control", "result 5 5\n");
+    EXPECT_TRUE(WIFI_TEST_ClearResult());
+    TestRoot other;
+    other.write("/wifitest/control", "result 5 5\n");
+    EXPECT_TRUE(WIFI_TEST_GetResult(&first, &second));
+    EXPECT_EQ(first, 5);
+    EXPECT_EQ(second, 5);
 }

@@ -36,7 +36,9 @@ struct TagRule {
 };
 
 struct LogState {
-    std::mutex mutex;
+    // Recursive: a signal handler that logs while this thread is inside a write
+    // (SIGPIPE from a stderr pipe whose reader is gone) must not deadlock.
+    std::recursive_mutex mutex;
     bool filterParsed = false;
     std::string filterEnv;  // ANDROID_LOG_TAGS as last parsed
     int defaultLevel = kDefaultLevel;
@@ -158,7 +160,7 @@ extern "C" int __android_log_print(int prio, const char *tag, const char *fmt, .
     if (fmt == nullptr) fmt = "";
     LogState &s = state();
     {
-        std::lock_guard<std::mutex> lock(s.mutex);
+        std::lock_guard<std::recursive_mutex> lock(s.mutex);
         if (prio < min_level(s, tag)) return 0;
     }
 
@@ -208,7 +210,7 @@ extern "C" int __android_log_print(int prio, const char *tag, const char *fmt, .
     const char *toStderr = getenv("TOLKD_LOG_STDERR");
     bool alsoStderr = toStderr != nullptr && strcmp(toStderr, "1") == 0;
     {
-        std::lock_guard<std::mutex> lock(s.mutex);
+        std::lock_guard<std::recursive_mutex> lock(s.mutex);
         int fd = dest_fd(s, dest);
         if (fd >= 0) write_all(fd, out, olen);
         if (fd < 0 || alsoStderr) write_all(STDERR_FILENO, out, olen);

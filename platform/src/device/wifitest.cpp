@@ -17,6 +17,7 @@
 #include <string.h>
 
 #include <mutex>
+#include <string>
 
 namespace {
 
@@ -30,9 +31,11 @@ struct Control {
     int32_t result[2] = {0, 0};
 };
 
-// What the fake chip remembers between calls.
+// What the fake chip remembers between calls. It belongs to one device root: a
+// process that moves to another root (tests do) meets a fresh chip there.
 struct Chip {
     std::mutex mutex;
+    std::string root;
     bool dutOpen = false;
     int32_t counters[2] = {0, 0};
     bool seenResult = false;
@@ -41,6 +44,21 @@ struct Chip {
 
 Chip &chip() {
     static Chip c;
+    return c;
+}
+
+// Call with the chip's mutex held.
+Chip &current_chip() {
+    Chip &c = chip();
+    const char *root = tolk_device_root();
+    std::string now = root != nullptr ? root : "";
+    if (now != c.root) {
+        c.root = now;
+        c.dutOpen = false;
+        c.counters[0] = c.counters[1] = 0;
+        c.seenResult = false;
+        c.seen[0] = c.seen[1] = 0;
+    }
     return c;
 }
 
@@ -93,7 +111,7 @@ void record(const char *fmt, ...) {
     Control ctl = read_control(name);                               \
     record("%s" fmt, name, ##__VA_ARGS__);                          \
     std::lock_guard<std::mutex> lock(chip().mutex);                 \
-    Chip &c = chip();                                               \
+    Chip &c = current_chip();                                       \
     (void)c;                                                        \
     if (ctl.fail) return false
 
