@@ -393,7 +393,8 @@ int send_radio_urc(const std::string &root, int slot, const std::string &text) {
         fprintf(stderr, "urc: the radio service is not running\n");
         return 1;
     }
-    std::string msg = std::to_string(slot) + cUnescape(text);
+    // tolk-sim has already turned the escapes of its argument into bytes.
+    std::string msg = std::to_string(slot) + text;
     bool sent = sendAll(fd, msg.data(), msg.size());
     shutdown(fd, SHUT_WR);
     char status = '1';

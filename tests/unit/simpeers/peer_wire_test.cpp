@@ -211,10 +211,10 @@ TEST(RadioPeer, UnsolicitedOutputReachesOnlyARegisteredClient) {
     int fd = connectSlot(peer, 1);
     ASSERT_TRUE(waitFor(peer.root() + "/run/radio.ctl"));
     // Connected but not registered: nothing to deliver to.
-    EXPECT_NE(send_radio_urc(peer.root(), 1, "\\r\\nRING\\r\\n"), 0);
+    EXPECT_NE(send_radio_urc(peer.root(), 1, "\r\nRING\r\n"), 0);
     sendFrame(fd, RADIO_WIRE_REGISTER);
     usleep(50000);
-    EXPECT_EQ(send_radio_urc(peer.root(), 1, "\\r\\nRING\\r\\n"), 0);
+    EXPECT_EQ(send_radio_urc(peer.root(), 1, "\r\nRING\r\n"), 0);
     Frame f;
     ASSERT_TRUE(recvFrame(fd, &f));
     EXPECT_EQ(f.type, static_cast<uint32_t>(RADIO_WIRE_INDICATION));
