@@ -101,6 +101,15 @@ private:
     T *m_ptr;
 };
 
+template <typename T>
+inline bool operator==(std::nullptr_t, const sp<T> &p) {
+    return p == nullptr;
+}
+template <typename T>
+inline bool operator!=(std::nullptr_t, const sp<T> &p) {
+    return p != nullptr;
+}
+
 }  // namespace android
 
 #endif

@@ -1,0 +1,287 @@
+// The IRadio proxy of the HIDL stand-in against an in-test radio service.
+#include <gtest/gtest.h>
+
+#include <atomic>
+#include <chrono>
+#include <condition_variable>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <vector>
+
+#include <vendor/orvane/hardware/radio/2.0/IRadio.h>
+
+#include "hidl_fake_radio_service.h"
+#include "test_root.h"
+
+using android::sp;
+using android::wp;
+using android::hardware::hidl_death_recipient;
+using android::hardware::hidl_vec;
+using android::hardware::Return;
+using android::hardware::Void;
+using android::hardware::radio::V1_0::RadioIndicationType;
+using android::hardware::radio::V1_0::RadioResponseInfo;
+using android::hidl::base::V1_0::IBase;
+using vendor::orvane::hardware::radio::V2_0::IRadio;
+using vendor::orvane::hardware::radio::V2_0::ITolkIndication;
+using vendor::orvane::hardware::radio::V2_0::ITolkResponse;
+
+namespace {
+
+std::string instancePath(const TestRoot &root, const std::string &instance) {
+    return root.at(std::string(RADIO_WIRE_PATH_PREFIX) + instance);
+}
+
+// Records every callback with the thread it ran on.
+struct Recorder {
+    std::mutex mutex;
+    std::condition_variable cv;
+    std::vector<std::string> events;
+    std::vector<std::thread::id> threads;
+    std::function<void()> hook;  // runs inside the callback, after recording
+    int inFlight = 0;
+
+    // Callbacks may still be running when a test ends; they must be done before
+    // the recorder they use goes away.
+    ~Recorder() {
+        std::unique_lock<std::mutex> lock(mutex);
+        cv.wait(lock, [&] { return inFlight == 0; });
+    }
+
+    void add(const std::string &e) {
+        {
+            std::lock_guard<std::mutex> lock(mutex);
+            events.push_back(e);
+            threads.push_back(std::this_thread::get_id());
+            inFlight++;
+        }
+        cv.notify_all();
+        if (hook) hook();
+        std::lock_guard<std::mutex> lock(mutex);
+        inFlight--;
+        cv.notify_all();
+    }
+    bool wait(size_t n, int ms = 3000) {
+        std::unique_lock<std::mutex> lock(mutex);
+        return cv.wait_for(lock, std::chrono::milliseconds(ms), [&] { return events.size() >= n; });
+    }
+};
+
+std::string bytes(const hidl_vec<uint8_t> &v) { return std::string(reinterpret_cast<const char *>(v.data()), v.size()); }
+
+struct Response : ITolkResponse {
+    explicit Response(Recorder *r) : rec(r) {}
+    Return<void> sendTolkResponse(const RadioResponseInfo &, const hidl_vec<uint8_t> &data) override {
+        rec->add("R:" + bytes(data));
+        return Void();
+    }
+    Recorder *rec;
+};
+
+struct Indication : ITolkIndication {
+    explicit Indication(Recorder *r) : rec(r) {}
+    Return<void> tolkInd(RadioIndicationType, const hidl_vec<uint8_t> &data) override {
+        rec->add("I:" + bytes(data));
+        return Void();
+    }
+    Recorder *rec;
+};
+
+struct Death : hidl_death_recipient {
+    explicit Death(Recorder *r) : rec(r) {}
+    void serviceDied(uint64_t cookie, const wp<IBase> &w) override {
+        who = w;
+        rec->add("D:" + std::to_string(cookie));
+    }
+    Recorder *rec;
+    wp<IBase> who;
+};
+
+bool eventually(const std::function<bool()> &cond, int ms = 3000) {
+    auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(ms);
+    while (std::chrono::steady_clock::now() < end) {
+        if (cond()) return true;
+        std::this_thread::sleep_for(std::chrono::milliseconds(5));
+    }
+    return cond();
+}
+
+}  // namespace
+
+TEST(HidlRadio, GetServiceFindsOnlyRunningInstances) {
+    TestRoot root;
+    EXPECT_EQ(nullptr, IRadio::getService("slot1", false));
+
+    FakeRadioService service(instancePath(root, "slot2"));
+    ASSERT_TRUE(service.ok());
+    EXPECT_EQ(nullptr, IRadio::getService("slot1", false));
+    sp<IRadio> radio = IRadio::getService("slot2", false);
+    ASSERT_NE(nullptr, radio);
+    EXPECT_TRUE(radio->isRemote());
+    EXPECT_TRUE(radio->ping().isOk());
+    EXPECT_TRUE(service.waitConnections(1));
+
+    // No passthrough implementation, and names cannot leave the instance folder.
+    EXPECT_EQ(nullptr, IRadio::getService("slot2", true));
+    EXPECT_EQ(nullptr, IRadio::getService("../radio.slot2", false));
+    EXPECT_EQ(nullptr, IRadio::getService("", false));
+
+    service.stop();
+    EXPECT_EQ(nullptr, IRadio::getService("slot2", false));
+}
+
+TEST(HidlRadio, RequestsReachTheServiceAndCallbacksArriveInOrderOnOneRuntimeThread) {
+    TestRoot root;
+    FakeRadioService service(instancePath(root, "slot1"));
+    ASSERT_TRUE(service.ok());
+    sp<IRadio> radio = IRadio::getService("slot1", false);
+    ASSERT_NE(nullptr, radio);
+
+    Recorder rec;
+    sp<Response> response = new Response(&rec);
+    sp<Indication> indication = new Indication(&rec);
+    EXPECT_TRUE(radio->registerTolkCallbacks(response, indication).isOk());
+
+    const char line[] = "AT+CSQ";
+    hidl_vec<uint8_t> request;
+    request.setToExternal(reinterpret_cast<uint8_t *>(const_cast<char *>(line)), sizeof(line));
+    EXPECT_TRUE(radio->sendTolkRequest(-1, request).isOk());
+
+    ASSERT_TRUE(service.waitFrames(2));
+    auto frames = service.frames();
+    EXPECT_EQ(RADIO_WIRE_REGISTER, frames[0].type);
+    EXPECT_EQ(RADIO_WIRE_REQUEST, frames[1].type);
+    EXPECT_EQ(-1, frames[1].serial);
+    EXPECT_EQ(std::string("AT+CSQ\0", 7), frames[1].payload);
+
+    std::vector<std::string> expected;
+    for (int i = 0; i < 40; i++) {
+        std::string text = "line" + std::to_string(i);
+        if (i % 3 == 0) {
+            ASSERT_TRUE(service.indicate(text));
+            expected.push_back("I:" + text);
+        } else {
+            ASSERT_TRUE(service.respond(text));
+            expected.push_back("R:" + text);
+        }
+    }
+    // Payload bytes pass unchanged, NULs and CR LF included.
+    ASSERT_TRUE(service.respond(std::string("\r\nOK\r\n\0x", 9)));
+    expected.push_back("R:" + std::string("\r\nOK\r\n\0x", 9));
+
+    ASSERT_TRUE(rec.wait(expected.size()));
+    std::lock_guard<std::mutex> lock(rec.mutex);
+    EXPECT_EQ(expected, rec.events);
+    for (const auto &id : rec.threads) {
+        EXPECT_NE(std::this_thread::get_id(), id);
+        EXPECT_EQ(rec.threads[0], id);
+    }
+}
+
+TEST(HidlRadio, DeathIsNotifiedOnceAndLaterSendsFailWithoutSigpipe) {
+    TestRoot root;
+    FakeRadioService service(instancePath(root, "slot3"));
+    ASSERT_TRUE(service.ok());
+    sp<IRadio> radio = IRadio::getService("slot3", false);
+    ASSERT_NE(nullptr, radio);
+
+    Recorder rec;
+    sp<Death> death = new Death(&rec);
+    sp<Death> unlinked = new Death(&rec);
+    EXPECT_TRUE(radio->linkToDeath(death, 7).isOk());
+    EXPECT_TRUE(radio->linkToDeath(unlinked, 8).isOk());
+    EXPECT_TRUE(radio->unlinkToDeath(unlinked));
+    ASSERT_TRUE(service.waitConnections(1));
+
+    service.stop();
+    service.dropConnections();
+    ASSERT_TRUE(rec.wait(1));
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    {
+        std::lock_guard<std::mutex> lock(rec.mutex);
+        ASSERT_EQ(1u, rec.events.size());
+        EXPECT_EQ("D:7", rec.events[0]);
+        EXPECT_NE(std::this_thread::get_id(), rec.threads[0]);
+    }
+    EXPECT_EQ(radio.get(), death->who.promote().get());
+
+    // SIGPIPE keeps its default action here: a send that raised it would end the test.
+    uint8_t b[] = {'A', 'T', 0};
+    hidl_vec<uint8_t> request;
+    request.setToExternal(b, sizeof(b));
+    EXPECT_FALSE(radio->sendTolkRequest(-1, request).isOk());
+    EXPECT_FALSE(radio->ping().isOk());
+    EXPECT_FALSE(radio->registerTolkCallbacks(nullptr, nullptr).isOk());
+}
+
+TEST(HidlRadio, ReleasedProxyStopsDeliveringAndNeverNotifiesDeath) {
+    TestRoot root;
+    FakeRadioService service(instancePath(root, "slot4"));
+    ASSERT_TRUE(service.ok());
+    Recorder rec;
+    sp<Death> death = new Death(&rec);
+    {
+        sp<IRadio> radio = IRadio::getService("slot4", false);
+        ASSERT_NE(nullptr, radio);
+        radio->linkToDeath(death, 1);
+        ASSERT_TRUE(service.waitConnections(1));
+    }
+    // The service sees the connection end, as when the client process lets go.
+    ASSERT_TRUE(eventually([&] { return !service.respond("late"); }));
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    std::lock_guard<std::mutex> lock(rec.mutex);
+    EXPECT_TRUE(rec.events.empty());
+}
+
+TEST(HidlRadio, ProxyCanBeReleasedFromItsOwnCallbackThread) {
+    TestRoot root;
+    FakeRadioService service(instancePath(root, "slot1"));
+    ASSERT_TRUE(service.ok());
+    std::mutex holder;  // declared first: outlives the recorder's wait for callbacks
+    Recorder rec;
+    sp<Response> response = new Response(&rec);
+    sp<IRadio> radio = IRadio::getService("slot1", false);
+    ASSERT_NE(nullptr, radio);
+    // The callback drops the last reference: the destructor runs on the reader
+    // thread itself and must neither join it nor crash.
+    rec.hook = [&] {
+        std::lock_guard<std::mutex> lock(holder);
+        radio.clear();
+    };
+    radio->registerTolkCallbacks(response, nullptr);
+    ASSERT_TRUE(service.waitFrames(1));
+    ASSERT_TRUE(service.respond("x"));
+    ASSERT_TRUE(rec.wait(1));
+    ASSERT_TRUE(eventually([&] {
+        std::lock_guard<std::mutex> lock(holder);
+        return radio == nullptr;
+    }));
+    EXPECT_TRUE(eventually([&] { return !service.respond("y"); }));
+}
+
+TEST(HidlRadio, ReleasingWhileTheCallbackWaitsForTheReleasersLockDoesNotDeadlock) {
+    TestRoot root;
+    FakeRadioService service(instancePath(root, "slot2"));
+    ASSERT_TRUE(service.ok());
+    std::mutex bridgeLock;
+    std::atomic<bool> callbackDone{false};
+    Recorder rec;
+    sp<Response> response = new Response(&rec);
+    sp<IRadio> radio = IRadio::getService("slot2", false);
+    ASSERT_NE(nullptr, radio);
+    rec.hook = [&] {
+        std::lock_guard<std::mutex> lock(bridgeLock);
+        callbackDone = true;
+    };
+    radio->registerTolkCallbacks(response, nullptr);
+    ASSERT_TRUE(service.waitFrames(1));
+
+    std::unique_lock<std::mutex> held(bridgeLock);
+    ASSERT_TRUE(service.respond("answer"));
+    ASSERT_TRUE(rec.wait(1));  // the callback now waits for bridgeLock
+    radio.clear();             // with bridgeLock held: must return at once
+    EXPECT_FALSE(callbackDone.load());
+    held.unlock();
+    EXPECT_TRUE(eventually([&] { return callbackDone.load(); }));
+}

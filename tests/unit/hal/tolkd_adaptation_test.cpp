@@ -1,0 +1,286 @@
+// The radio HAL bridge against an in-test radio service.
+#include <gtest/gtest.h>
+
+#include <poll.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <chrono>
+#include <functional>
+#include <string>
+#include <thread>
+
+#include <cutils/properties.h>
+
+#include "../../platform/hidl_fake_radio_service.h"
+#include "core/reader.h"
+#include "dispatch/dispatcher.h"
+#include "hal/tolkd_adaptation.h"
+#include "hal/tolkd_adaptation_impl.h"
+#include "serial/response_writer.h"
+#include "serial/serial_device.h"
+#include "targets/target_conn.h"
+#include "targets/target_relay.h"
+#include "test_root.h"
+
+namespace {
+
+bool eventually(const std::function<bool()> &cond, int ms = 3000) {
+    auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(ms);
+    while (std::chrono::steady_clock::now() < end) {
+        if (cond()) return true;
+        std::this_thread::sleep_for(std::chrono::milliseconds(5));
+    }
+    return cond();
+}
+
+// Everything a descriptor delivers within ms, once it stays quiet.
+std::string drain(int fd, int ms = 300) {
+    std::string out;
+    char buf[8192];
+    for (;;) {
+        pollfd p{fd, POLLIN, 0};
+        if (poll(&p, 1, ms) <= 0) break;
+        ssize_t n = recv(fd, buf, sizeof(buf), MSG_DONTWAIT);
+        if (n <= 0) break;
+        out.append(buf, static_cast<size_t>(n));
+        ms = 50;
+    }
+    return out;
+}
+
+bool slotEmpty(int slot) {
+    pthread_mutex_lock(&gTolkdAdaptation->mMutex);
+    bool empty = gTolkdAdaptation->mRadio[slot] == nullptr;
+    pthread_mutex_unlock(&gTolkdAdaptation->mMutex);
+    return empty;
+}
+
+// A fresh device root, a host link to capture answers, and a bridge with no proxy
+// and a fresh modem pair.
+class HalBridge : public ::testing::Test {
+protected:
+    void SetUp() override {
+        int host[2];
+        ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM, 0, host));
+        hostFd_ = host[1];
+        gSerialDevice.fd[DEVICE_SERIAL] = host[0];
+        gSerialDevice.currDevice = DEVICE_SERIAL;
+        gNumericMode = false;
+        isATCmdInject = false;
+        isMsgCmdInput = false;
+        s_fdRild_command = -1;
+        connectTarget(RIL_TYPE);
+        ASSERT_GE(s_fdRild_command, 0);
+        ASSERT_NE(nullptr, gTolkdAdaptation);
+        gTolkdAdaptation->serviceDied();
+    }
+    void TearDown() override {
+        // Proxies point at this test's services; the next test starts without them.
+        gTolkdAdaptation->serviceDied();
+        close(gSerialDevice.fd[DEVICE_SERIAL]);
+        gSerialDevice.fd[DEVICE_SERIAL] = -1;
+        close(hostFd_);
+        close(s_fdRild_command);
+        s_fdRild_command = -1;
+    }
+    std::string slotPath(const char *instance) { return root_.at(std::string(RADIO_WIRE_PATH_PREFIX) + instance); }
+
+    TestRoot root_;
+    int hostFd_ = -1;
+};
+
+}  // namespace
+
+TEST_F(HalBridge, SlotComesFromTheSimSelection) {
+    EXPECT_EQ(0, TolkdAdaptation::getSlotId());  // unset: slot 0
+    const struct {
+        const char *sim;
+        const char *cdma;
+        int slot;
+    } cases[] = {
+        {"0", nullptr, 0}, {"1", nullptr, 1}, {"2", nullptr, 2}, {"3", nullptr, 3},
+        {"9", nullptr, 0},  // CDMA slot defaults to the first
+        {"9", "2", 1},      {"9", "1", 0},    {"9", "0", -1},   {"4", nullptr, -1},
+        {"-1", nullptr, -1}, {"8", nullptr, -1}, {"10", nullptr, -1},
+    };
+    for (const auto &c : cases) {
+        TestRoot root;  // fresh properties for each case
+        ASSERT_EQ(0, property_set("persist.service.tolk.sim", c.sim));
+        if (c.cdma) {
+            ASSERT_EQ(0, property_set("persist.radio.cdma_slot", c.cdma));
+        }
+        EXPECT_EQ(c.slot, TolkdAdaptation::getSlotId()) << "sim " << c.sim << " cdma " << (c.cdma ? c.cdma : "-");
+    }
+}
+
+TEST_F(HalBridge, CommandGoesToTheSelectedSlotWithItsNulAndAnswersComeBackThroughThePair) {
+    FakeRadioService slot1(slotPath("slot1"));
+    FakeRadioService slot2(slotPath("slot2"));
+    ASSERT_TRUE(slot1.ok() && slot2.ok());
+    ASSERT_EQ(0, property_set("persist.service.tolk.sim", "9"));
+    ASSERT_EQ(0, property_set("persist.radio.cdma_slot", "2"));
+
+    EXPECT_EQ(0, sendDataToRild("AT+CSQ"));
+    EXPECT_TRUE(isATCmdInject);
+    ASSERT_TRUE(slot2.waitFrames(2));
+    auto frames = slot2.frames();
+    EXPECT_EQ(RADIO_WIRE_REGISTER, frames[0].type);
+    EXPECT_EQ(RADIO_WIRE_REQUEST, frames[1].type);
+    EXPECT_EQ(-1, frames[1].serial);
+    EXPECT_EQ(std::string("AT+CSQ\0", 7), frames[1].payload);
+    EXPECT_EQ(0, slot1.connections());
+    EXPECT_EQ("", drain(hostFd_, 50));  // nothing for the host yet
+
+    // Answer and unsolicited output reach the main-loop end byte for byte, in order.
+    ASSERT_TRUE(slot2.respond("\r\n+CSQ: 20,99\r\n\r\nOK\r\n"));
+    ASSERT_TRUE(slot2.indicate(std::string("\r\n+CREG: 1\r\n\0", 13)));
+    std::string expected = std::string("\r\n+CSQ: 20,99\r\n\r\nOK\r\n") + std::string("\r\n+CREG: 1\r\n\0", 13);
+    std::string got;
+    ASSERT_TRUE(eventually([&] {
+        got += drain(s_fdRild_command, 20);
+        return got.size() >= expected.size();
+    }));
+    EXPECT_EQ(expected, got);
+
+    // The same proxy serves the next command: no new connection, no new registration.
+    EXPECT_TRUE(sendRequest("AT", 3));
+    ASSERT_TRUE(slot2.waitFrames(3));
+    EXPECT_EQ(1, slot2.connections());
+    EXPECT_EQ(RADIO_WIRE_REQUEST, slot2.frames()[2].type);
+}
+
+TEST_F(HalBridge, MissingServiceOrSlotAnswersNoModemAndStillMarksTheCommand) {
+    // No service at all.
+    EXPECT_EQ(0, sendDataToRild("AT+CSQ"));
+    EXPECT_TRUE(isATCmdInject);
+    EXPECT_EQ("\r\nERROR:No Modem\r\n", drain(hostFd_));
+
+    // An unsupported selection refuses without touching any service.
+    FakeRadioService slot1(slotPath("slot1"));
+    ASSERT_TRUE(slot1.ok());
+    ASSERT_EQ(0, property_set("persist.service.tolk.sim", "4"));
+    isATCmdInject = false;
+    EXPECT_FALSE(sendRequest("AT", 3));
+    EXPECT_EQ(0, sendDataToRild("AT"));
+    EXPECT_TRUE(isATCmdInject);
+    EXPECT_EQ("\r\nERROR:No Modem\r\n", drain(hostFd_));
+    EXPECT_EQ(0, slot1.connections());
+
+    // Back to slot 0: the service that appeared meanwhile is found.
+    ASSERT_EQ(0, property_set("persist.service.tolk.sim", "0"));
+    EXPECT_TRUE(sendRequest("AT", 3));
+    EXPECT_TRUE(slot1.waitFrames(2));
+}
+
+TEST_F(HalBridge, TransportFailureDropsTheProxyAndTheNextRequestSetsUpAgain) {
+    FakeRadioService slot1(slotPath("slot1"));
+    ASSERT_TRUE(slot1.ok());
+    ASSERT_TRUE(sendRequest("AT", 3));
+    ASSERT_TRUE(slot1.waitFrames(2));
+    // Without the death link only the failing request can find out.
+    gTolkdAdaptation->mRadio[0]->unlinkToDeath(gTolkdAdaptation->mDeathRecipient);
+    slot1.dropConnections();
+    ASSERT_TRUE(eventually([] { return !gTolkdAdaptation->mRadio[0]->ping().isOk(); }));
+    ASSERT_FALSE(slotEmpty(0));
+
+    EXPECT_FALSE(sendRequest("AT+CSQ", 7));
+    EXPECT_TRUE(slotEmpty(0));
+
+    EXPECT_TRUE(sendRequest("AT+CSQ", 7));
+    ASSERT_TRUE(slot1.waitFrames(4));
+    auto frames = slot1.frames();
+    EXPECT_EQ(1, frames[2].connection);
+    EXPECT_EQ(RADIO_WIRE_REGISTER, frames[2].type);
+    EXPECT_EQ(std::string("AT+CSQ\0", 7), frames[3].payload);
+}
+
+TEST_F(HalBridge, ServiceDeathDropsEveryProxyAndTheNextCommandRegistersAgain) {
+    FakeRadioService slot1(slotPath("slot1"));
+    FakeRadioService slot3(slotPath("slot3"));
+    ASSERT_TRUE(slot1.ok() && slot3.ok());
+    ASSERT_TRUE(sendRequest("AT", 3));
+    ASSERT_EQ(0, property_set("persist.service.tolk.sim", "2"));
+    ASSERT_TRUE(sendRequest("AT", 3));
+    ASSERT_FALSE(slotEmpty(0));
+    ASSERT_FALSE(slotEmpty(2));
+    ASSERT_TRUE(slot3.waitFrames(2));
+
+    slot3.dropConnections();
+    ASSERT_TRUE(eventually([] { return slotEmpty(0) && slotEmpty(2); }));
+
+    ASSERT_TRUE(sendRequest("AT+CGSN", 8));
+    ASSERT_TRUE(slot3.waitFrames(4));
+    auto frames = slot3.frames();
+    EXPECT_EQ(1, frames[2].connection);
+    EXPECT_EQ(RADIO_WIRE_REGISTER, frames[2].type);
+    EXPECT_EQ(RADIO_WIRE_REQUEST, frames[3].type);
+    // Answers on the new connection reach the pair.
+    ASSERT_TRUE(slot3.respond("OK"));
+    EXPECT_EQ("OK", drain(s_fdRild_command));
+}
+
+TEST_F(HalBridge, NewModemPairReplacesAndClosesTheOldBridgeEnd) {
+    FakeRadioService slot1(slotPath("slot1"));
+    ASSERT_TRUE(slot1.ok());
+    ASSERT_TRUE(sendRequest("AT", 3));
+    ASSERT_TRUE(slot1.waitFrames(2));
+    int oldMainEnd = s_fdRild_command;
+
+    // The main loop gave up its end; the next pass makes a new pair.
+    s_fdRild_command = -1;
+    connectTarget(RIL_TYPE);
+    ASSERT_GE(s_fdRild_command, 0);
+    // The bridge's old end is closed: the old main-loop end sees the end of stream.
+    char c;
+    EXPECT_EQ(0, recv(oldMainEnd, &c, 1, 0));
+    close(oldMainEnd);
+
+    ASSERT_TRUE(slot1.respond("\r\nRING\r\n"));
+    EXPECT_EQ("\r\nRING\r\n", drain(s_fdRild_command));
+
+    // With a valid link nothing new is made.
+    int current = s_fdRild_command;
+    connectTarget(RIL_TYPE);
+    EXPECT_EQ(current, s_fdRild_command);
+    ASSERT_TRUE(slot1.respond("OK"));
+    EXPECT_EQ("OK", drain(s_fdRild_command));
+}
+
+TEST_F(HalBridge, SwappingThePairWhileAnswersStreamInNeverWritesIntoAClosedEnd) {
+    FakeRadioService slot1(slotPath("slot1"));
+    ASSERT_TRUE(slot1.ok());
+    ASSERT_TRUE(sendRequest("AT", 3));
+    ASSERT_TRUE(slot1.waitFrames(2));
+    std::thread answers([&] {
+        for (int i = 0; i < 300; i++) slot1.respond("X");
+    });
+    // Each new pair replaces the previous one while the callback thread writes and
+    // descriptor numbers are reused at once: the main-loop end only ever sees
+    // whole answers, and nothing strays onto the host link.
+    for (int i = 0; i < 50; i++) {
+        close(s_fdRild_command);
+        s_fdRild_command = -1;
+        connectTarget(RIL_TYPE);
+        ASSERT_GE(s_fdRild_command, 0);
+        std::string got = drain(s_fdRild_command, 1);
+        EXPECT_EQ(std::string::npos, got.find_first_not_of('X')) << got;
+    }
+    answers.join();
+    EXPECT_EQ("", drain(hostFd_, 20));
+}
+
+TEST_F(HalBridge, LineWithSubOrEscEndsSmsTextInput) {
+    FakeRadioService slot1(slotPath("slot1"));
+    ASSERT_TRUE(slot1.ok());
+    isMsgCmdInput = true;
+    sendDataToRild("hello");
+    EXPECT_TRUE(isMsgCmdInput);
+    sendDataToRild("hello\x1a");
+    EXPECT_FALSE(isMsgCmdInput);
+    isMsgCmdInput = true;
+    sendDataToRild("\x1b");
+    EXPECT_FALSE(isMsgCmdInput);
+    ASSERT_TRUE(slot1.waitFrames(4));
+    EXPECT_EQ(std::string("hello\x1a\0", 7), slot1.frames()[2].payload);
+}
