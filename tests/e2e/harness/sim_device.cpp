@@ -319,3 +319,12 @@ std::string visible(const std::string &bytes) {
     }
     return out;
 }
+
+bool SimDevice::waitForLog(const std::string &needle, int timeoutMs) const {
+    long long deadline = monoMs() + timeoutMs;
+    for (;;) {
+        if (log().find(needle) != std::string::npos) return true;
+        if (monoMs() >= deadline) return false;
+        sleepMs(10);
+    }
+}

@@ -1,0 +1,170 @@
+// The two host links as a factory host sees them: the serial port's line
+// discipline (line ends, echo, backspace) and the adb link's line assembly.
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include "sim_device.h"
+
+namespace {
+
+const std::string kCsdf = "\r\n+CSDF: 1,1\n\r\n\r\nOK\r\n";
+
+class Links : public ::testing::Test {
+protected:
+    // The descriptor count once the daemon has seen the last client go.
+    int settledFdCount() {
+        int last = dev.tolkdFdCount();
+        for (int i = 0; i < 20; i++) {
+            usleep(50 * 1000);
+            int now = dev.tolkdFdCount();
+            if (now == last) return now;
+            last = now;
+        }
+        return last;
+    }
+
+    void SetUp() override { ASSERT_TRUE(dev.started()) << dev.upOutput(); }
+
+    // Sends raw bytes on a fresh serial descriptor and returns what comes back.
+    std::string serial(const std::string &bytes, int quietMs = 400) {
+        int fd = dev.openSerial();
+        EXPECT_GE(fd, 0);
+        if (fd < 0) return "";
+        EXPECT_TRUE(writeAll(fd, bytes));
+        std::string got = readQuiet(fd, quietMs);
+        close(fd);
+        return got;
+    }
+
+    SimDevice dev;
+};
+
+TEST_F(Links, SerialLineEndsAtCrLfCtrlZAndEsc) {
+    // The port echoes as the host types; a CR arrives as LF (ICRNL).
+    EXPECT_EQ("AT+CSDF?\n" + kCsdf, serial("AT+CSDF?\r"));
+    EXPECT_EQ("AT+CSDF?\n" + kCsdf, serial("AT+CSDF?\n"));
+    // Ctrl-Z and ESC end a line too; the delimiter is echoed and then dropped.
+    EXPECT_EQ(visible("AT+CSDF?\x1a" + kCsdf), visible(serial("AT+CSDF?\x1a")));
+    EXPECT_EQ(visible("AT+CSDF?\x1b" + kCsdf), visible(serial("AT+CSDF?\x1b")));
+    // Lower case is accepted; the command name is upper-cased before dispatch.
+    EXPECT_EQ("at+csdf?\n" + kCsdf, serial("at+csdf?\r"));
+}
+
+TEST_F(Links, EchoFollowsAte0AndAte1PerLink) {
+    EXPECT_EQ("ATE0\n\r\nOK\r\n", dev.at("ATE0"));
+    EXPECT_EQ(visible(kCsdf), visible(dev.at("AT+CSDF?")));
+    // Echo is a serial matter: the adb link never echoes, and its ATE1 does not
+    // switch the serial port's echo back on.
+    EXPECT_EQ("\r\nOK\r\n", dev.at("ATE1", true));
+    EXPECT_EQ(visible(kCsdf), visible(dev.at("AT+CSDF?", true)));
+    EXPECT_EQ(visible(kCsdf), visible(dev.at("AT+CSDF?")));
+    EXPECT_EQ("\r\nOK\r\n", dev.at("ATE1"));
+    EXPECT_EQ(visible("AT+CSDF?\n" + kCsdf), visible(dev.at("AT+CSDF?")));
+    // ATQ0V1E keeps the current setting.
+    EXPECT_EQ("ATQ0V1E\n\r\nOK\r\n", dev.at("ATQ0V1E"));
+    EXPECT_EQ(visible("AT+CSDF?\n" + kCsdf), visible(dev.at("AT+CSDF?")));
+}
+
+TEST_F(Links, BackspaceEditsTheLineOnBothLinks) {
+    EXPECT_EQ(visible("AT+CSX\bDF?\n" + kCsdf), visible(serial("AT+CSX\bDF?\r")));
+    EXPECT_EQ(visible(kCsdf), visible(dev.at("AT+CSX\\bDF?", true)));
+    // A backspace at the start of the line removes nothing.
+    EXPECT_EQ(visible(kCsdf), visible(dev.at("\\bAT+CSDF?", true)));
+    // Editing "AT" away leaves a line that is not a command.
+    EXPECT_EQ("", dev.at("AT\\b\\b+CSDF?", true));
+}
+
+TEST_F(Links, ShortAndForeignLinesGetNoAnswer) {
+    EXPECT_EQ("A\n", serial("A\r"));
+    EXPECT_EQ("\n", serial("\r"));
+    EXPECT_EQ("XY+CSDF?\n", serial("XY+CSDF?\r"));
+    EXPECT_EQ("", dev.at("A", true));
+    EXPECT_EQ("", dev.at("", true));
+    // The link is still in order afterwards.
+    EXPECT_EQ(visible(kCsdf), visible(dev.at("AT+CSDF?", true)));
+}
+
+TEST_F(Links, AdbAssemblesALineAcrossPacketsAndTakesOneLinePerPacket) {
+    int fd = dev.connectAdb();
+    ASSERT_GE(fd, 0);
+    ASSERT_TRUE(writeAll(fd, "AT+C"));
+    usleep(100 * 1000);
+    ASSERT_TRUE(writeAll(fd, "SDF"));
+    usleep(100 * 1000);
+    ASSERT_TRUE(writeAll(fd, "?\r"));
+    EXPECT_EQ(visible(kCsdf), visible(readQuiet(fd)));
+
+    // A second line in the same packet is discarded.
+    ASSERT_TRUE(writeAll(fd, "AT+CSDF=?\rAT+CSDF?\r"));
+    EXPECT_EQ(visible("\r\n+CSDF: (1,2,3,4,5,6,7),(1,2)\n\r\n\r\nOK\r\n"), visible(readQuiet(fd)));
+    // LF does not end an adb line; it stays in the line and the CR ends it.
+    ASSERT_TRUE(writeAll(fd, "AT+CSDF?\n"));
+    EXPECT_EQ("", readQuiet(fd));
+    ASSERT_TRUE(writeAll(fd, "\r"));
+    EXPECT_NE("", readQuiet(fd));
+    close(fd);
+}
+
+TEST_F(Links, AdbLineIsCutAt6144Bytes) {
+    int fd = dev.connectAdb();
+    ASSERT_GE(fd, 0);
+    // 6144 bytes without CR make one complete line; its last byte is dropped as
+    // the delimiter and trailing blanks are trimmed.
+    std::string line = "AT+CSDF=3" + std::string(6144 - 9, ' ');
+    ASSERT_TRUE(writeAll(fd, line));
+    EXPECT_EQ("\r\nOK\r\n", readQuiet(fd));
+    ASSERT_TRUE(writeAll(fd, "AT+CSDF?\r"));
+    EXPECT_EQ(visible("\r\n+CSDF: 3,1\n\r\n\r\nOK\r\n"), visible(readQuiet(fd)));
+
+    // What follows the first 6144 bytes starts a new line ("XY\r": dropped).
+    line = "AT+CSDF=4" + std::string(6144 - 9, ' ') + "XY\r";
+    ASSERT_TRUE(writeAll(fd, line));
+    EXPECT_EQ("\r\nOK\r\n", readQuiet(fd, 500));
+    ASSERT_TRUE(writeAll(fd, "AT+CSDF?\r"));
+    EXPECT_EQ(visible("\r\n+CSDF: 4,1\n\r\n\r\nOK\r\n"), visible(readQuiet(fd)));
+    close(fd);
+}
+
+TEST_F(Links, AdbReconnectsWithoutLeakingDescriptors) {
+    EXPECT_EQ(visible(kCsdf), visible(dev.at("AT+CSDF?", true)));
+    int before = settledFdCount();
+    ASSERT_GT(before, 0);
+    for (int i = 0; i < 5; i++) EXPECT_EQ(visible(kCsdf), visible(dev.at("AT+CSDF?", true))) << i;
+    EXPECT_EQ(before, settledFdCount());
+    // The serial link was served all along.
+    EXPECT_EQ(visible("AT+CSDF?\n" + kCsdf), visible(dev.at("AT+CSDF?")));
+    EXPECT_EQ(-1, dev.tolkdExitStatus(50));
+}
+
+TEST_F(Links, NewAdbConnectionReplacesAnOpenOne) {
+    int first = dev.connectAdb();
+    ASSERT_GE(first, 0);
+    ASSERT_TRUE(writeAll(first, "AT+CSDF?\r"));
+    EXPECT_EQ(visible(kCsdf), visible(readQuiet(first)));
+    int count = settledFdCount();
+
+    int second = dev.connectAdb();
+    ASSERT_GE(second, 0);
+    ASSERT_TRUE(writeAll(second, "AT+CSDF?\r"));
+    EXPECT_EQ(visible(kCsdf), visible(readQuiet(second)));
+    // The daemon serves one connection at a time: the old one is closed
+    // rather than left open and forgotten.
+    char c;
+    EXPECT_EQ(0, read(first, &c, 1));
+    EXPECT_EQ(count, settledFdCount());
+
+    for (int i = 0; i < 3; i++) {
+        int next = dev.connectAdb();
+        ASSERT_GE(next, 0);
+        ASSERT_TRUE(writeAll(next, "AT+CSDF?\r"));
+        EXPECT_EQ(visible(kCsdf), visible(readQuiet(next)));
+        close(second);
+        second = next;
+    }
+    EXPECT_EQ(count, settledFdCount());
+    close(first);
+    close(second);
+}
+
+}  // namespace

@@ -1,0 +1,131 @@
+// Start-up of the daemon on the simulated device: boot-mode gating, the ATM mode
+// without a serial port, a missing control socket, and the PCT-mode switch
+// written at every start.
+#include <limits.h>
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <dirent.h>
+
+#include <gtest/gtest.h>
+
+#include "sim_device.h"
+
+namespace {
+
+const char kCsdfAnswer[] = "\r\n+CSDF: 1,1\n\r\n\r\nOK\r\n";
+
+// True when tolkd holds a descriptor on the device side of the serial link.
+bool tolkdHoldsSerialPort(const SimDevice &d) {
+    char target[PATH_MAX];
+    ssize_t n = readlink((d.root() + "/dev/ttyGS0").c_str(), target, sizeof target - 1);
+    if (n <= 0) return false;
+    target[n] = '\0';
+    std::string fdDir = "/proc/" + std::to_string(d.tolkdPid()) + "/fd";
+    DIR *dir = opendir(fdDir.c_str());
+    if (!dir) return false;
+    bool found = false;
+    while (struct dirent *e = readdir(dir)) {
+        char link[PATH_MAX];
+        ssize_t m = readlink((fdDir + "/" + e->d_name).c_str(), link, sizeof link - 1);
+        if (m > 0) {
+            link[m] = '\0';
+            if (std::string(link) == target) found = true;
+        }
+    }
+    closedir(dir);
+    return found;
+}
+
+TEST(Startup, EngineeringBootModeStopsTheDaemonWithStatusZero) {
+    for (const char *mode : {"5", "57"}) {
+        SCOPED_TRACE(std::string("boot mode file \"") + mode + "\"");
+        SimDevice d({"--boot-mode", mode});
+        EXPECT_NE(0, d.upStatus());
+        EXPECT_NE(std::string::npos, d.upOutput().find("tolkd exited with status 0")) << d.upOutput();
+        EXPECT_EQ(0, d.tolkdExitStatus());
+        EXPECT_NE(std::string::npos, d.log().find("advanced vemo mode, stop tolkd-daemon"));
+        EXPECT_EQ(std::string::npos, d.log().find("tolkd-daemon start!!!"));
+        // No property is touched in this mode.
+        EXPECT_EQ("", d.getprop("persist.service.pct.mode"));
+    }
+}
+
+TEST(Startup, OtherBootModesServe) {
+    struct Case {
+        std::vector<std::string> args;
+        const char *logLine;
+    };
+    const Case cases[] = {
+        {{"--boot-mode", ""}, "Boot mode = 0"},
+        {{"--boot-mode", "x5"}, "Boot mode = 0"},
+        {{"--boot-mode", "4"}, "Boot mode = 4"},
+        {{"--no-boot-mode"}, "Boot mode = -1"},
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(c.logLine);
+        SimDevice d(c.args);
+        ASSERT_TRUE(d.started()) << d.upOutput();
+        EXPECT_NE(std::string::npos, d.log().find(c.logLine)) << d.log();
+        EXPECT_NE(std::string::npos, d.log().find("tolkd-daemon start!!!"));
+        EXPECT_EQ(kCsdfAnswer, d.at("AT+CSDF?", true)) << "adb link";
+    }
+    SimDevice missing({"--no-boot-mode"});
+    EXPECT_NE(std::string::npos,
+              missing.log().find("Failed to open boot mode file /sys/class/BOOT/BOOT/boot/boot_mode"));
+}
+
+TEST(Startup, AtmModeServesTheAdbLinkOnly) {
+    for (const char *atm : {"enable", "enabled"}) {
+        SCOPED_TRACE(atm);
+        SimDevice d({"--prop", std::string("ro.boot.atm=") + atm});
+        ASSERT_TRUE(d.started()) << d.upOutput();
+        EXPECT_FALSE(tolkdHoldsSerialPort(d));
+        EXPECT_EQ(kCsdfAnswer, d.at("AT+CSDF?", true));
+        // Nobody answers on the serial link (the idle port may still echo).
+        std::string serial = d.at("AT+CSDF?");
+        EXPECT_EQ(std::string::npos, serial.find("OK")) << visible(serial);
+    }
+    // Only the exact lower-case prefix counts.
+    SimDevice d({"--prop", "ro.boot.atm=Enable"});
+    ASSERT_TRUE(d.started()) << d.upOutput();
+    EXPECT_TRUE(tolkdHoldsSerialPort(d));
+    EXPECT_EQ(std::string("AT+CSDF?\n") + kCsdfAnswer, d.at("AT+CSDF?"));
+}
+
+TEST(Startup, MissingControlSocketLeavesTheSerialLink) {
+    SimDevice d({"--no-control-socket"});
+    ASSERT_TRUE(d.started()) << d.upOutput();
+    EXPECT_NE(std::string::npos, d.log().find("Failed to get socket 'adb_tolk_socket'"));
+    EXPECT_EQ(-1, d.connectAdb());
+    EXPECT_EQ(std::string("AT+CSDF?\n") + kCsdfAnswer, d.at("AT+CSDF?"));
+    EXPECT_EQ(-1, d.tolkdExitStatus(100)) << "tolkd must keep running";
+}
+
+TEST(Startup, AtmModeWithoutControlSocketStillRuns) {
+    SimDevice d({"--prop", "ro.boot.atm=enable", "--no-control-socket"});
+    ASSERT_TRUE(d.started()) << d.upOutput();
+    EXPECT_EQ(-1, d.tolkdExitStatus(200));
+}
+
+TEST(Startup, PctModeFollowsTheOperatorAtEveryStart) {
+    {
+        SimDevice d;
+        ASSERT_TRUE(d.started()) << d.upOutput();
+        EXPECT_EQ("1", d.getprop("persist.service.pct.mode"));
+    }
+    {
+        SimDevice d({"--prop", "persist.operator.optr=OP07"});
+        ASSERT_TRUE(d.started()) << d.upOutput();
+        EXPECT_EQ("0", d.getprop("persist.service.pct.mode"));
+        EXPECT_NE(std::string::npos, d.log().find("operator is OP07 and set PCT mode 0 for AT&T"));
+    }
+    {
+        // A stale "0" of an earlier operator is overwritten; the test is exact.
+        SimDevice d({"--prop", "persist.operator.optr=OP07X", "--prop", "persist.service.pct.mode=0"});
+        ASSERT_TRUE(d.started()) << d.upOutput();
+        EXPECT_EQ("1", d.getprop("persist.service.pct.mode"));
+    }
+}
+
+}  // namespace
