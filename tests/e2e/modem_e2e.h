@@ -14,13 +14,15 @@
 namespace modem_e2e {
 
 // One host link kept open. On the serial link the line discipline echoes what
-// the host types, so the link is opened with ATE0 first and its answer drained.
+// the host types, so the link is normally opened with ATE0 first and its answer
+// drained. (An echo switch also leaves ESC without its line-ending role on the
+// port, so tests of ESC on the serial port keep the echo and expect it.)
 class HostLink {
 public:
-    HostLink(SimDevice &dev, bool adb) : adb_(adb) {
+    HostLink(SimDevice &dev, bool adb, bool echoOff = true) : adb_(adb) {
         fd_ = adb ? dev.connectAdb() : dev.openSerial();
         EXPECT_GE(fd_, 0) << (adb ? "adb" : "serial") << " link";
-        if (!adb && fd_ >= 0) {
+        if (!adb && fd_ >= 0 && echoOff) {
             writeAll(fd_, "ATE0\r");
             readQuiet(fd_, 300);
         }
