@@ -1,12 +1,19 @@
-// Test helper: puts the in-memory state of the local commands and the MMI
-// command sequence queue back to what a freshly started daemon has.
+// Test helpers: the in-memory state of a freshly started daemon, and a fixture
+// that calls handlers the way the dispatcher does.
 #ifndef TOLK_TESTS_DISPATCH_HANDLER_STATE_H
 #define TOLK_TESTS_DISPATCH_HANDLER_STATE_H
 
-#include <cstring>
+#include <cutils/properties.h>
+#include <gtest/gtest.h>
 
+#include <cstring>
+#include <string>
+
+#include "dispatch/dispatcher.h"
 #include "handlers/handlers.h"
+#include "host_capture.h"
 #include "targets/mmi_queue.h"
+#include "test_root.h"
 
 inline void resetHandlerState() {
     for (int &v : gCmecConfig) v = 2;
@@ -16,14 +23,31 @@ inline void resetHandlerState() {
     gCclkTz = 65535;
     wifiEnableState = -1;
     wifiBand = -1;
-    wifiFrequency = 0;
-    wifiDataRate = 0;
-    wifiTxPower = 0;
-}
-
-inline void resetMmiQueue() {
+    wifiFrequency = wifiDataRate = wifiTxPower = 0;
     std::memset(&gMmiCmdSeq, 0, sizeof(gMmiCmdSeq));
     for (int &s : gMmiCmdSeq.seq) s = -1;
 }
+
+inline std::string prop(const char *name, const char *def = "(unset)") {
+    char value[PROPERTY_VALUE_MAX];
+    property_get(name, value, def);
+    return value;
+}
+
+class HandlerTest : public ::testing::Test {
+protected:
+    void SetUp() override { resetHandlerState(); }
+    void TearDown() override { resetHandlerState(); }
+
+    // A zeroed response buffer for every call, as the dispatcher gives.
+    int call(CmdHandler h, const char *param, int op) {
+        std::memset(response, 0, sizeof(response));
+        return h(param, op, response);
+    }
+
+    TestRoot root;
+    HostCapture host;
+    char response[RESPONSE_BUF_SIZE];
+};
 
 #endif
