@@ -122,7 +122,9 @@ int setEchoOption(int on) {
     struct termios options;
     memset(&options, 0, sizeof(options));
     const bool haveSettings = tcgetattr(fd, &options) == 0;
-    options.c_lflag = on == 1 ? (ICANON | ECHO) : ICANON;
+    // IEXTEN stays as the port had it: without it the kernel no longer ends a line at
+    // VEOL2, and an SMS body cancelled with ESC would never reach the reader.
+    options.c_lflag = (on == 1 ? (ICANON | ECHO) : ICANON) | (options.c_lflag & IEXTEN);
 
     // Recorded even where the link is no terminal, so a later reopen honours it.
     gSerialDevice.echoOption[cur] = on;
