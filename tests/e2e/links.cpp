@@ -2,6 +2,9 @@
 // discipline (line ends, echo, backspace) and the adb link's line assembly.
 #include <unistd.h>
 
+#include <chrono>
+#include <functional>
+
 #include <gtest/gtest.h>
 
 #include "sim_device.h"
@@ -73,6 +76,25 @@ TEST_F(Links, BackspaceEditsTheLineOnBothLinks) {
     EXPECT_EQ(visible(kCsdf), visible(dev.at("\\bAT+CSDF?", true)));
     // Editing "AT" away leaves a line that is not a command.
     EXPECT_EQ("", dev.at("AT\\b\\b+CSDF?", true));
+}
+
+long long elapsedMs(const std::function<void()> &f) {
+    auto start = std::chrono::steady_clock::now();
+    f();
+    return std::chrono::duration_cast<std::chrono::milliseconds>(std::chrono::steady_clock::now() - start).count();
+}
+
+// The host client ends an exchange at the final result, not at the quiet time,
+// and still collects a second result line that follows at once.
+TEST_F(Links, HostClientStopsAtTheFinalResult) {
+    std::string got;
+    EXPECT_LT(elapsedMs([&] { got = dev.at("AT+CSDF?", true, 3000); }), 2500);
+    EXPECT_EQ(visible(kCsdf), visible(got));
+    EXPECT_LT(elapsedMs([&] { got = dev.at("AT@USBCONFIG?", false, 3000); }), 2500);
+    EXPECT_EQ(visible("AT@USBCONFIG?\n\r\n@USBCONFIG: \"\"\r\n\r\nERROR\r\n\r\nERROR\r\n"), visible(got));
+    // Several lines on one adb connection, each answered in turn.
+    got = dev.at(std::vector<std::string>{"AT+CSDF=2", "AT+CSDF?", "AT+CSDF=1"}, true);
+    EXPECT_EQ(visible("\r\nOK\r\n\r\n+CSDF: 2,1\n\r\n\r\nOK\r\n\r\nOK\r\n"), visible(got));
 }
 
 TEST_F(Links, ShortAndForeignLinesGetNoAnswer) {

@@ -2,6 +2,7 @@
 // without a serial port, a missing control socket, and the PCT-mode switch
 // written at every start.
 #include <limits.h>
+#include <signal.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -126,6 +127,41 @@ TEST(Startup, PctModeFollowsTheOperatorAtEveryStart) {
         ASSERT_TRUE(d.started()) << d.upOutput();
         EXPECT_EQ("1", d.getprop("persist.service.pct.mode"));
     }
+}
+
+}  // namespace
+
+namespace {
+
+bool processAlive(pid_t pid) { return pid > 0 && kill(pid, 0) == 0; }
+
+// The simulator itself: one device per root, and down leaves nothing running.
+TEST(Simulator, DownStopsEverythingAndIsIdempotent) {
+    SimDevice d;
+    ASSERT_TRUE(d.started()) << d.upOutput();
+    pid_t tolkd = d.tolkdPid();
+    pid_t supervisor = static_cast<pid_t>(atol(d.env("TOLK_SIM_PID").c_str()));
+    ASSERT_TRUE(processAlive(tolkd));
+    ASSERT_TRUE(processAlive(supervisor));
+    EXPECT_EQ(d.root() + "/host/ttyACM0", d.env("TOLK_HOST_TTY"));
+    EXPECT_EQ(d.root() + "/dev/socket/adb_tolk_socket", d.env("TOLK_ADB_SOCKET"));
+
+    std::string out;
+    EXPECT_NE(0, runSim({"up", "--root", d.root()}, &out, true));
+    EXPECT_NE(std::string::npos, out.find("already up")) << out;
+    EXPECT_EQ(tolkd, d.tolkdPid());
+
+    EXPECT_EQ(0, d.sim({"down"}).size());
+    // tolkd and the supervisor are gone (a zombie of tolkd would be reaped by
+    // the supervisor before it exits).
+    for (int i = 0; i < 100 && (processAlive(tolkd) || processAlive(supervisor)); i++) usleep(20 * 1000);
+    EXPECT_FALSE(processAlive(tolkd));
+    EXPECT_FALSE(processAlive(supervisor));
+    int status = -1;
+    d.sim({"down"}, &status);
+    EXPECT_EQ(0, status);
+    d.sim({"replug"}, &status);
+    EXPECT_NE(0, status) << "no device is up any more";
 }
 
 }  // namespace
