@@ -128,8 +128,8 @@ bool hasFinalResult(const std::string &received, bool numeric) {
 int cmdAt(const AtOptions &opt) {
     std::vector<std::string> payloads;
     for (const auto &l : opt.lines) {
-        std::string bytes, err;
-        if (!decodeEscapes(l, &bytes, &err)) {
+        std::string bytes = l, err;
+        if (!opt.rawLines && !decodeEscapes(l, &bytes, &err)) {
             fprintf(stderr, "tolk-sim at: %s\n", err.c_str());
             return 2;
         }
@@ -190,6 +190,27 @@ int cmdAt(const AtOptions &opt) {
 }
 
 int cmdConsole(const std::string &root, bool adb) {
+    if (!isatty(0)) {
+        // Piped input: one exchange per line, as a host program would do it
+        // (the adb link takes one line per packet).
+        AtOptions opt;
+        opt.root = root;
+        opt.adb = adb;
+        opt.rawLines = true;
+        opt.timeoutSec = 3600;
+        std::string line;
+        int c;
+        while ((c = getchar()) != EOF) {
+            if (c == '\n') {
+                opt.lines.push_back(line);
+                line.clear();
+            } else {
+                line.push_back(static_cast<char>(c));
+            }
+        }
+        if (!line.empty()) opt.lines.push_back(line);
+        return opt.lines.empty() ? 0 : cmdAt(opt);
+    }
     std::string err;
     int fd = openLink(root, adb, &err);
     if (fd < 0) {

@@ -14,7 +14,8 @@ struct AtOptions {
     int timeoutSec = 60;
     int quietMs = 300;
     bool noCr = false;
-    std::vector<std::string> lines;  // with escapes still in them
+    bool rawLines = false;           // lines are bytes already: no escapes
+    std::vector<std::string> lines;  // with escapes still in them (unless rawLines)
 };
 
 // True when the bytes received so far hold a final result line of an AT
