@@ -6,7 +6,6 @@
 #include <vector>
 
 #include <hidl/HidlSupport.h>
-#include <hidl/Status.h>
 #include <utils/RefBase.h>
 #include <utils/StrongPointer.h>
 
@@ -14,8 +13,6 @@ using android::RefBase;
 using android::sp;
 using android::wp;
 using android::hardware::hidl_vec;
-using android::hardware::Return;
-using android::hardware::Status;
 
 namespace {
 
@@ -132,16 +129,4 @@ TEST(HidlVec, WrapsExternalBytesWithoutCopyingAndCopiesOwnTheirBytes) {
     EXPECT_EQ(0u, copy.size());
     EXPECT_EQ(3u, moved.size());
     EXPECT_EQ('B', moved[0]);
-}
-
-TEST(HidlStatus, ReturnCarriesTransportFailure) {
-    Return<void> ok = android::hardware::Void();
-    EXPECT_TRUE(ok.isOk());
-    Return<void> failed(Status::fromExceptionCode(Status::EX_TRANSACTION_FAILED, "gone"));
-    EXPECT_FALSE(failed.isOk());
-    Return<bool> value(true);
-    EXPECT_TRUE(value.isOk());
-    EXPECT_TRUE(static_cast<bool>(value));
-    Return<bool> lost(Status::fromExceptionCode(Status::EX_TRANSACTION_FAILED));
-    EXPECT_TRUE(lost.withDefault(true));
 }

@@ -155,15 +155,3 @@ TEST_F(MmiQueue, AnswerTextEndsAtItsFirstNulAndMissingAnswerSendsNothing) {
     EXPECT_EQ(4, gMmiCmdSeq.SIdx);
     EXPECT_EQ("", mmiClient());
 }
-
-TEST_F(MmiQueue, ResetFreesEveryEntry) {
-    mmiCommand("X");
-    gMmiCmdSeq.cusMmiCmdPending = 1;
-    mmiCmdSeqReset();
-    EXPECT_EQ(0, gMmiCmdSeq.idx);
-    EXPECT_EQ(0, gMmiCmdSeq.cusMmiCmdPending);
-    EXPECT_EQ(0, gMmiCmdSeq.EIdx);
-    EXPECT_EQ(0, gMmiCmdSeq.enSeqIdx);
-    EXPECT_EQ('\0', gMmiCmdSeq.cmd[0][0]);
-    for (int i = 0; i < MMI_QUEUE_SIZE; i++) EXPECT_EQ(-1, gMmiCmdSeq.seq[i]);
-}
