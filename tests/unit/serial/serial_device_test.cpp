@@ -1,7 +1,6 @@
 // The serial port's terminal settings, applied to a real pseudo-terminal: port open,
 // the echo switch and the MMI test option set with its restore.
 #include <sys/socket.h>
-#include <unistd.h>
 
 #include <filesystem>
 
@@ -10,13 +9,10 @@
 
 namespace {
 
-using serial_test::Pty;
 using serial_test::readFor;
-using serial_test::SerialFixture;
 
 struct termios settingsOf(int fd) {
-    struct termios t;
-    memset(&t, 0, sizeof(t));
+    struct termios t = {};
     EXPECT_EQ(0, tcgetattr(fd, &t));
     return t;
 }
@@ -28,76 +24,51 @@ bool sameSettings(const struct termios &a, const struct termios &b) {
 
 const tcflag_t kOflagCleared = OPOST | OLCUC | OCRNL | ONOCR | ONLRET;
 
-class SerialDeviceTest : public SerialFixture {
+class SerialDeviceTest : public serial_test::SerialFixture {
 protected:
     void SetUp() override {
         SerialFixture::SetUp();
         ASSERT_TRUE(pty_.ok());
+        before_ = settingsOf(pty_.master);
     }
-    // Opens the pty slave as the serial port of the current line.
+    // Opens the pty slave as the serial port that supplied the current line.
     int openPort() {
-        int fd = open_serial_device(&gSerialDevice, pty_.slavePath().c_str());
+        int fd = open_serial_device(&gSerialDevice, pty_.slavePath.c_str());
         EXPECT_GE(fd, 0);
         gSerialDevice.fd[DEVICE_SERIAL] = fd;
-        gSerialDevice.currDevice = DEVICE_SERIAL;
         return fd;
     }
-    Pty pty_;
+    // The adb connection, a socket without terminal settings, as the current link.
+    void useAdbSocket() {
+        int sv[2];
+        ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM, 0, sv));
+        own(sv[1]);
+        gSerialDevice.fd[DEVICE_ADB] = sv[0];
+        gSerialDevice.currDevice = DEVICE_ADB;
+    }
+    serial_test::Pty pty_;
+    struct termios before_ = {};
 };
 
-TEST_F(SerialDeviceTest, ResetRecordMarksLinksClosed) {
-    memset(&gSerialDevice, 0x5A, sizeof(gSerialDevice));
-    initSerialDevice(&gSerialDevice);
-    for (int i = 0; i < DEVICE_COUNT; i++) {
-        EXPECT_EQ(-1, gSerialDevice.fd[i]);
-        EXPECT_EQ('\0', gSerialDevice.devName[i][0]);
-    }
-    EXPECT_EQ(1, gSerialDevice.echoOption[DEVICE_SERIAL]);
-    EXPECT_EQ(1, gSerialDevice.echoOption[DEVICE_ADB_LISTEN]);
-    EXPECT_EQ(0, gSerialDevice.echoOption[DEVICE_ADB]);
-    EXPECT_EQ(0, gSerialDevice.cmdLen);
-    EXPECT_EQ(0, gSerialDevice.state);
-    EXPECT_EQ(0, gSerialDevice.currDevice);
-    EXPECT_EQ('\0', gSerialDevice.cmdBuf[0]);
-    EXPECT_EQ('\0', gSerialDevice.cmdBuf[DATA_BUF_SIZE - 1]);
-}
-
 TEST_F(SerialDeviceTest, OpenOtherPortMasksOutputAndEchoes) {
-    const struct termios before = settingsOf(pty_.master());
     // Echo off recorded for the gadget port does not apply to other ports.
     gSerialDevice.echoOption[DEVICE_SERIAL] = 0;
     const int fd = openPort();
     ASSERT_GE(fd, 0);
-
     EXPECT_EQ(0, fcntl(fd, F_GETFL) & O_NONBLOCK) << "later I/O must block";
     const struct termios t = settingsOf(fd);
-    EXPECT_EQ(before.c_oflag & ~kOflagCleared, t.c_oflag);
+    EXPECT_EQ(before_.c_oflag & ~kOflagCleared, t.c_oflag);
     EXPECT_EQ(static_cast<tcflag_t>(ICANON | ECHO | IEXTEN), t.c_lflag);
     EXPECT_EQ(0x1A, t.c_cc[VEOL]);
     EXPECT_EQ(0x1B, t.c_cc[VEOL2]);
-    EXPECT_EQ(before.c_iflag, t.c_iflag);
-    EXPECT_EQ(before.c_cflag, t.c_cflag);
+    EXPECT_EQ(before_.c_iflag, t.c_iflag);
+    EXPECT_EQ(before_.c_cflag, t.c_cflag);
 
     EXPECT_EQ(-1, open_serial_device(&gSerialDevice, "/nonexistent/ttyX"));
     EXPECT_EQ(-1, open_serial_device(&gSerialDevice, nullptr));
 }
 
-TEST_F(SerialDeviceTest, CanonicalLinesEndAtSubAndEsc) {
-    const int fd = openPort();
-    ASSERT_GE(fd, 0);
-    // Also after an echo switch (ATE0): an SMS body ended by Ctrl-Z or cancelled with
-    // ESC, without newline, arrives with that character last.
-    ASSERT_EQ(0, setEchoOption(0));
-    ASSERT_EQ(6, write(pty_.master(), "hello\x1a", 6));
-    EXPECT_EQ("hello\x1a", readFor(fd, 6));
-    ASSERT_EQ(4, write(pty_.master(), "bye\x1b", 4));
-    EXPECT_EQ("bye\x1b", readFor(fd, 4));
-    // Without a line end nothing is handed over.
-    ASSERT_EQ(3, write(pty_.master(), "AT+", 3));
-    EXPECT_EQ("", readFor(fd, 0, 100));
-}
-
-TEST_F(SerialDeviceTest, EchoSwitch) {
+TEST_F(SerialDeviceTest, EchoSwitchKeepsSmsLineEnds) {
     const int fd = openPort();
     ASSERT_GE(fd, 0);
     const struct termios opened = settingsOf(fd);
@@ -108,27 +79,23 @@ TEST_F(SerialDeviceTest, EchoSwitch) {
     EXPECT_EQ(static_cast<tcflag_t>(ICANON | IEXTEN), t.c_lflag);
     EXPECT_EQ(opened.c_oflag, t.c_oflag);
     EXPECT_EQ(opened.c_iflag, t.c_iflag);
-    EXPECT_EQ(0x1A, t.c_cc[VEOL]);
+
+    // After ATE0 an SMS body ended by Ctrl-Z, or cancelled with ESC, without newline,
+    // still reaches the reader with that character last.
+    ASSERT_EQ(6, write(pty_.master, "hello\x1a", 6));
+    EXPECT_EQ("hello\x1a", readFor(fd, 6));
+    ASSERT_EQ(4, write(pty_.master, "bye\x1b", 4));
+    EXPECT_EQ("bye\x1b", readFor(fd, 4));
+    ASSERT_EQ(3, write(pty_.master, "AT+", 3));
+    EXPECT_EQ("", readFor(fd, 0, 100));
 
     EXPECT_EQ(0, setEchoOption(1));
     EXPECT_EQ(static_cast<tcflag_t>(ICANON | ECHO | IEXTEN), settingsOf(fd).c_lflag);
-    EXPECT_EQ(1, gSerialDevice.echoOption[DEVICE_SERIAL]);
-
-    // A port without IEXTEN (the MMI test set) does not gain it.
-    setMMITESTOption(1);
-    EXPECT_EQ(0, setEchoOption(1));
-    EXPECT_EQ(static_cast<tcflag_t>(ICANON | ECHO), settingsOf(fd).c_lflag);
-    EXPECT_EQ(1, gSerialDevice.echoOption[DEVICE_SERIAL]);
 
     // On the adb socket the setting is recorded although no terminal takes it.
-    int sv[2];
-    ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM, 0, sv));
-    own(sv[1]);
-    gSerialDevice.fd[DEVICE_ADB] = sv[0];
-    gSerialDevice.currDevice = DEVICE_ADB;
+    useAdbSocket();
     EXPECT_EQ(-1, setEchoOption(1));
     EXPECT_EQ(1, gSerialDevice.echoOption[DEVICE_ADB]);
-    EXPECT_EQ(1, gSerialDevice.echoOption[DEVICE_SERIAL]);
 }
 
 TEST_F(SerialDeviceTest, MmiTestSetAndRestore) {
@@ -145,31 +112,19 @@ TEST_F(SerialDeviceTest, MmiTestSetAndRestore) {
     EXPECT_EQ(0, t.c_cc[VERASE]);
     EXPECT_EQ(opened.c_cflag, t.c_cflag);
 
-    // An echo switch during the test mode is undone by the restore, but stays recorded.
+    // An echo switch in test mode is undone by the restore but stays recorded.
     EXPECT_EQ(0, setEchoOption(0));
-    setMMITESTOption(0);
-    EXPECT_TRUE(sameSettings(opened, settingsOf(fd)));
-    EXPECT_EQ(0, gSerialDevice.echoOption[DEVICE_SERIAL]);
-}
+    EXPECT_EQ(static_cast<tcflag_t>(ICANON), settingsOf(fd).c_lflag);
 
-TEST_F(SerialDeviceTest, MmiTestKeepsSavedSettingsWhenLinkHasNone) {
-    const int fd = openPort();
-    ASSERT_GE(fd, 0);
-    const struct termios opened = settingsOf(fd);
-    setMMITESTOption(1);
-
-    // Enable on the adb socket: nothing readable, so the saved record is kept.
-    int sv[2];
-    ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM, 0, sv));
-    own(sv[1]);
-    gSerialDevice.fd[DEVICE_ADB] = sv[0];
-    gSerialDevice.currDevice = DEVICE_ADB;
+    // Enable on the adb socket: nothing readable there, the saved record is kept.
+    useAdbSocket();
     setMMITESTOption(1);
     EXPECT_TRUE(sameSettings(opened, last_deviceOptions));
 
     gSerialDevice.currDevice = DEVICE_SERIAL;
     setMMITESTOption(0);
     EXPECT_TRUE(sameSettings(opened, settingsOf(fd)));
+    EXPECT_EQ(0, gSerialDevice.echoOption[DEVICE_SERIAL]);
 }
 
 TEST_F(SerialDeviceTest, RestoreWithoutEnableLeavesPortAlone) {
@@ -184,27 +139,23 @@ TEST_F(SerialDeviceTest, RestoreWithoutEnableLeavesPortAlone) {
 TEST_F(SerialDeviceTest, GadgetPortUnderDeviceRoot) {
     TestRoot root;
     std::filesystem::create_directories(root.at("/dev"));
-    std::filesystem::create_symlink(pty_.slavePath(), root.at(SERIAL_DEV_NAME));
+    std::filesystem::create_symlink(pty_.slavePath, root.at(SERIAL_DEV_NAME));
 
+    // A fresh record has echo on; the gadget port gets exactly ONLCR for output.
     const int fd = open_serial_device(&gSerialDevice, SERIAL_DEV_NAME);
     if (fd < 0) GTEST_SKIP() << "open() is not redirected under the device root in this build";
     gSerialDevice.fd[DEVICE_SERIAL] = fd;
-
-    // A fresh record has echo on; the gadget port gets exactly ONLCR for output.
     struct termios t = settingsOf(fd);
     EXPECT_EQ(static_cast<tcflag_t>(ONLCR), t.c_oflag);
     EXPECT_EQ(static_cast<tcflag_t>(ICANON | ECHO | IEXTEN), t.c_lflag);
-    EXPECT_EQ(0x1A, t.c_cc[VEOL]);
     EXPECT_EQ(0x1B, t.c_cc[VEOL2]);
 
     // After ATE0 a reopen keeps echo off.
-    gSerialDevice.currDevice = DEVICE_SERIAL;
     ASSERT_EQ(0, setEchoOption(0));
     close(fd);
-    const int again = open_serial_device(&gSerialDevice, SERIAL_DEV_NAME);
-    gSerialDevice.fd[DEVICE_SERIAL] = again;
-    ASSERT_GE(again, 0);
-    EXPECT_EQ(static_cast<tcflag_t>(ICANON | IEXTEN), settingsOf(again).c_lflag);
+    gSerialDevice.fd[DEVICE_SERIAL] = open_serial_device(&gSerialDevice, SERIAL_DEV_NAME);
+    ASSERT_GE(gSerialDevice.fd[DEVICE_SERIAL], 0);
+    EXPECT_EQ(static_cast<tcflag_t>(ICANON | IEXTEN), settingsOf(gSerialDevice.fd[DEVICE_SERIAL]).c_lflag);
 }
 
 }  // namespace
