@@ -22,10 +22,6 @@ struct Counted : virtual public RefBase {
     std::atomic<int> *deaths_;
 };
 
-struct Derived : public Counted {
-    using Counted::Counted;
-};
-
 }  // namespace
 
 TEST(HidlRefBase, LastStrongReferenceDestroysOnceAndWeakOnesOutliveIt) {
@@ -55,23 +51,6 @@ TEST(HidlRefBase, LastStrongReferenceDestroysOnceAndWeakOnesOutliveIt) {
     EXPECT_EQ(nullptr, weak.promote());
     wp<Counted> copy = weak;
     EXPECT_EQ(nullptr, copy.promote());
-    EXPECT_EQ(1, deaths.load());
-}
-
-TEST(HidlRefBase, ConvertsBetweenBaseAndDerivedReferences) {
-    std::atomic<int> deaths{0};
-    {
-        sp<Derived> d = new Derived(&deaths);
-        sp<Counted> base = d;
-        wp<Counted> weakBase = d;
-        EXPECT_EQ(2, d->getStrongCount());
-        d.clear();
-        EXPECT_EQ(0, deaths.load());
-        EXPECT_NE(nullptr, weakBase.promote());
-        sp<Counted> moved = std::move(base);
-        EXPECT_EQ(nullptr, base);
-        EXPECT_EQ(1, moved->getStrongCount());
-    }
     EXPECT_EQ(1, deaths.load());
 }
 
