@@ -31,36 +31,15 @@ volatile sig_atomic_t gStop = 0;
 
 void onTerm(int) { gStop = 1; }
 
-// The frame wire, kept here so the service does not depend on the daemon-side
-// helpers: a fixed header in host byte order, then the payload.
 bool wireSend(int fd, uint32_t type, int32_t serial, int32_t extra, const std::string &payload) {
-    RadioWireHeader h;
-    h.type = type;
-    h.serial = serial;
-    h.extra = extra;
-    h.length = static_cast<uint32_t>(payload.size());
-    std::string frame(reinterpret_cast<const char *>(&h), sizeof h);
-    frame += payload;
-    return sendAll(fd, frame.data(), frame.size());
-}
-
-bool readFull(int fd, void *buf, size_t len) {
-    char *p = static_cast<char *>(buf);
-    while (len > 0) {
-        ssize_t n = read(fd, p, len);
-        if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) return false;
-        p += n;
-        len -= static_cast<size_t>(n);
-    }
-    return true;
+    return radio_wire_send(fd, type, serial, extra, payload.data(), static_cast<uint32_t>(payload.size())) == 0;
 }
 
 bool wireRecv(int fd, RadioWireHeader *h, std::string *payload) {
-    if (!readFull(fd, h, sizeof *h)) return false;
-    if (h->length > RADIO_WIRE_MAX_PAYLOAD) return false;
-    payload->assign(h->length, '\0');
-    return h->length == 0 || readFull(fd, &(*payload)[0], h->length);
+    static std::vector<char> buf(RADIO_WIRE_MAX_PAYLOAD);
+    if (radio_wire_recv(fd, h, buf.data(), buf.size()) != 0) return false;
+    payload->assign(buf.data(), h->length);
+    return true;
 }
 
 struct Client {

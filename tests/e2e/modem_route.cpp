@@ -3,6 +3,9 @@
 // where unsolicited modem output goes.
 #include "modem_e2e.h"
 
+#include <pty.h>
+#include <termios.h>
+
 using namespace modem_e2e;
 
 namespace {
@@ -168,4 +171,27 @@ TEST(ModemRoute, UnsolicitedOutputGoesToTheLinkOfTheLastCommand) {
     // Output of a slot the daemon does not use has nobody to go to.
     dev.sim({"urc", "--slot", "2", "\\r\\nRING\\r\\n"}, &status);
     EXPECT_NE(status, 0);
+}
+
+TEST(ModemRoute, SlotOneCanBeAModemOnASerialDevice) {
+    int master = -1, slave = -1;
+    char name[64];
+    ASSERT_EQ(openpty(&master, &slave, name, nullptr, nullptr), 0);
+    SimDevice dev(openModem({"--modem-tty", name}));
+    ASSERT_TRUE(dev.started()) << dev.upOutput();
+    HostLink host(dev, true);
+    // The modem gets the command line with the CR it waits for...
+    writeAll(host.fd(), "AT+CSQ\r");
+    EXPECT_EQ(visible(readUntil(master, "\r", 3000)), visible("AT+CSQ\r"));
+    // ...and whatever it says reaches the host, unsolicited lines included.
+    writeAll(master, "\r\n+CSQ: 9,99\r\n\r\nOK\r\n");
+    EXPECT_EQ(visible(host.quiet()), visible("\r\n+CSQ: 9,99\r\n\r\nOK\r\n"));
+    writeAll(master, "\r\nRING\r\n");
+    EXPECT_EQ(visible(host.quiet()), visible("\r\nRING\r\n"));
+    // The other slots are still simulated.
+    dev.setprop("persist.service.tolk.sim", "1");
+    EXPECT_EQ(visible(host.cmd("AT+CGSN")), visible("\r\n350000000000002\r\n\r\nOK\r\n"));
+    EXPECT_EQ(radioJournal(dev, 1), "AT+CSQ\\x00\n");
+    close(master);
+    close(slave);
 }

@@ -164,7 +164,9 @@ TEST(RadioPeer, ScriptsOverrideSplitDelayAndSilence) {
          "AT+FOO => (none)\n"
          "AT+BAR => (gap 150) (split) \\r\\n+BAR: 1\\r\\n || \\r\\nOK\\r\\n\n"
          "AT+SLOW => (delay 400) \\r\\nOK\\r\\n\n");
-    spit(peer.root() + "/sim/radio/slot3.script", "AT+CSQ => \\r\\n+CSQ: 3,99\\r\\n\\r\\nOK\\r\\n\n");
+    spit(peer.root() + "/sim/radio/slot3.script",
+         "AT+CSQ => \\r\\n+CSQ: 3,99\\r\\n\\r\\nOK\\r\\n\n"
+         "AT+DIE => (close)\n");
     int fd1 = connectSlot(peer, 1), fd3 = connectSlot(peer, 3);
     sendFrame(fd1, RADIO_WIRE_REGISTER);
     sendFrame(fd3, RADIO_WIRE_REGISTER);
@@ -202,6 +204,14 @@ TEST(RadioPeer, ScriptsOverrideSplitDelayAndSilence) {
     sendFrame(fd1, RADIO_WIRE_REQUEST, request("AT+CSQ"));
     ASSERT_TRUE(recvFrame(fd1, &f));
     EXPECT_EQ(f.payload, "\r\n+CSQ: 20,99\r\n\r\nOK\r\n");
+    // (close) looks like the death of the service to that client only.
+    sendFrame(fd3, RADIO_WIRE_REQUEST, request("AT+DIE"));
+    ASSERT_TRUE(readable(fd3, 1000));
+    char c;
+    EXPECT_EQ(read(fd3, &c, 1), 0);
+    sendFrame(fd1, RADIO_WIRE_REQUEST, request("AT"));
+    ASSERT_TRUE(recvFrame(fd1, &f));
+    EXPECT_EQ(f.payload, "\r\nOK\r\n");
     close(fd1);
     close(fd3);
 }
