@@ -6,6 +6,9 @@
 #include "modem_script.h"
 #include "peers.h"
 
+#include <cutils/sockets.h>
+#include <tolk_platform/local_socket.h>
+
 #include <errno.h>
 #include <poll.h>
 #include <signal.h>
@@ -20,7 +23,7 @@ using namespace tolksim;
 
 namespace {
 
-const char kServicePath[] = "/dev/socket/tolk-service";
+const char kServiceName[] = "tolk-service";
 const char kMmiMark[] = "+ORVTOLKJ";
 volatile sig_atomic_t gStop = 0;
 
@@ -49,6 +52,7 @@ private:
     ScriptFile script_;
     std::string journal_;
     int listenFd_ = -1;
+    std::string socketPath_;
     std::vector<int> clients_;
     std::vector<Pending> pending_;
 };
@@ -103,8 +107,16 @@ void GenericService::deliverDue() {
 }
 
 int GenericService::run() {
-    listenFd_ = listenUnix(underRoot(root_, kServicePath));
-    if (listenFd_ < 0) return 1;
+    // Served where the daemon's socket_local_client looks for it: the reserved
+    // namespace under the device root.
+    struct sockaddr_un addr;
+    if (tolk_local_address(kServiceName, ANDROID_SOCKET_NAMESPACE_RESERVED, &addr) < 0) return 1;
+    socketPath_ = addr.sun_path;
+    listenFd_ = tolk_local_server(kServiceName, ANDROID_SOCKET_NAMESPACE_RESERVED, SOCK_STREAM, 4);
+    if (listenFd_ < 0) {
+        fprintf(stderr, "generic: cannot serve %s: %s\n", socketPath_.c_str(), strerror(errno));
+        return 1;
+    }
     while (!gStop) {
         std::vector<struct pollfd> fds;
         fds.push_back({listenFd_, POLLIN, 0});
@@ -132,7 +144,7 @@ int GenericService::run() {
     }
     for (int c : std::vector<int>(clients_)) dropClient(c);
     close(listenFd_);
-    unlink(underRoot(root_, kServicePath).c_str());
+    unlink(socketPath_.c_str());
     return 0;
 }
 
@@ -153,6 +165,9 @@ int run_generic_peer(const std::string &root, const std::vector<std::string> &ar
     sigaction(SIGTERM, &sa, nullptr);
     sigaction(SIGINT, &sa, nullptr);
     signal(SIGPIPE, SIG_IGN);
+    // The socket helpers resolve device paths under TOLKD_ROOT; tolk-sim sets it,
+    // a peer started by hand may not.
+    setenv("TOLKD_ROOT", root.c_str(), 1);
     GenericService service(root);
     return service.run();
 }
