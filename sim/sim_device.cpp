@@ -977,8 +977,13 @@ int cmdUp(UpOptions opt) {
         if (nul >= 0) {
             dup2(nul, 0);
             dup2(nul, 1);
-            dup2(nul, 2);
             if (nul > 2) close(nul);
+        }
+        // Anything the supervisor itself prints (a sanitizer report) is kept.
+        int err = open(RootLayout{opt.root}.supervisorLog().c_str(), O_WRONLY | O_CREAT | O_APPEND, 0644);
+        if (err >= 0) {
+            dup2(err, 2);
+            if (err > 2) close(err);
         }
         Supervisor sup(opt, pfd[1]);
         _exit(sup.run());
