@@ -15,8 +15,7 @@ namespace modem_e2e {
 
 // One host link kept open. On the serial link the line discipline echoes what
 // the host types, so the link is normally opened with ATE0 first and its answer
-// drained. (An echo switch also leaves ESC without its line-ending role on the
-// port, so tests of ESC on the serial port keep the echo and expect it.)
+// drained; echoOff false keeps the echo (and the port settings of the open).
 class HostLink {
 public:
     HostLink(SimDevice &dev, bool adb, bool echoOff = true) : adb_(adb) {

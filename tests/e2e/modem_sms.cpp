@@ -24,6 +24,10 @@ TEST(ModemSms, TextIsRelayedLineByLineOnTheSerialPort) {
     EXPECT_EQ(visible(host.send("world\x1a")), visible(sent(1)));
     // Text input is over: the next line is a command again.
     EXPECT_EQ(visible(host.cmd("AT")), visible("\r\nOK\r\n"));
+    // ESC, too, ends a line after an echo switch: the message is abandoned and
+    // the modem's OK ends the text input.
+    EXPECT_EQ(visible(host.cmd("AT+CMGW=\"5\"")), visible(kPrompt));
+    EXPECT_EQ(visible(host.send("draft\x1b")), visible("\r\nOK\r\n"));
     EXPECT_EQ(visible(host.cmd("AT+CMGS=?")), visible("\r\nOK\r\n"));
     EXPECT_EQ(visible(host.cmd("AT+CSQ")), visible("\r\n+CSQ: 20,99\r\n\r\nOK\r\n"));
     EXPECT_EQ(radioJournal(dev, 1),
@@ -31,6 +35,8 @@ TEST(ModemSms, TextIsRelayedLineByLineOnTheSerialPort) {
               "hello\\n\\x00\n"
               "world\\x1a\\x00\n"
               "AT\\x00\n"
+              "AT+CMGW=\"5\"\\x00\n"
+              "draft\\x1b\\x00\n"
               "AT+CMGS=?\\x00\n"
               "AT+CSQ\\x00\n");
 }

@@ -9,12 +9,10 @@
 
 #include <fcntl.h>
 #include <poll.h>
-#include <pty.h>
 #include <signal.h>
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
-#include <termios.h>
 #include <unistd.h>
 
 #include <fstream>
@@ -234,50 +232,6 @@ TEST(RadioPeer, UnsolicitedOutputReachesOnlyARegisteredClient) {
     close(fd);
     peer.stop();
     EXPECT_NE(send_radio_urc(peer.root(), 1, "x"), 0);
-}
-
-TEST(RadioPeer, ForwardsSlotOneToAModemTty) {
-    int master, slave;
-    char name[64];
-    ASSERT_EQ(openpty(&master, &slave, name, nullptr, nullptr), 0);
-    struct termios t;
-    tcgetattr(master, &t);
-    cfmakeraw(&t);
-    tcsetattr(master, TCSANOW, &t);
-    Peer peer("radio", {"--modem-tty", name});
-    int fd = connectSlot(peer, 1);
-    sendFrame(fd, RADIO_WIRE_REGISTER);
-    sendFrame(fd, RADIO_WIRE_REQUEST, request("AT+CSQ"));
-    char buf[64];
-    ASSERT_TRUE(readable(master, 2000));
-    usleep(50000);
-    ssize_t n = read(master, buf, sizeof buf);
-    EXPECT_EQ(std::string(buf, n > 0 ? n : 0), "AT+CSQ\r");
-    // SMS text keeps its own end.
-    sendFrame(fd, RADIO_WIRE_REQUEST, request("text\x1a"));
-    ASSERT_TRUE(readable(master, 2000));
-    usleep(50000);
-    n = read(master, buf, sizeof buf);
-    EXPECT_EQ(std::string(buf, n > 0 ? n : 0), "text\x1a");
-    ASSERT_EQ(write(master, "\r\n+CSQ: 9,99\r\n\r\nOK\r\n", 20), 20);
-    std::string got;
-    Frame f;
-    while (got.size() < 20 && recvFrame(fd, &f)) got += f.payload;
-    EXPECT_EQ(got, "\r\n+CSQ: 9,99\r\n\r\nOK\r\n");
-    // Unsolicited modem output goes the same way.
-    ASSERT_EQ(write(master, "\r\nRING\r\n", 8), 8);
-    ASSERT_TRUE(recvFrame(fd, &f));
-    EXPECT_EQ(f.payload, "\r\nRING\r\n");
-    // Other slots stay simulated.
-    int fd2 = connectSlot(peer, 2);
-    sendFrame(fd2, RADIO_WIRE_REGISTER);
-    sendFrame(fd2, RADIO_WIRE_REQUEST, request("AT"));
-    ASSERT_TRUE(recvFrame(fd2, &f));
-    EXPECT_EQ(f.payload, "\r\nOK\r\n");
-    close(fd);
-    close(fd2);
-    close(master);
-    close(slave);
 }
 
 TEST(GenericPeer, AnswersHoldsAndRecordsMessages) {
