@@ -428,8 +428,14 @@ pid_t Supervisor::spawnTolkd() {
 
 // tolkd serves once its main thread blocks in the reader's select.
 bool Supervisor::tolkdInMainWait() {
-    std::string s = readFileOr("/proc/" + std::to_string(tolkd_) + "/syscall");
-    if (s.empty() || !isdigit(static_cast<unsigned char>(s[0]))) return false;
+    std::string proc = "/proc/" + std::to_string(tolkd_);
+    std::string s;
+    if (!readFile(proc + "/syscall", &s) || s.empty()) {
+        // Kernels without syscall tracing: the wait channel names the select wait.
+        std::string wchan = readFileOr(proc + "/wchan");
+        return wchan.find("select") != std::string::npos || wchan.find("poll_schedule") != std::string::npos;
+    }
+    if (!isdigit(static_cast<unsigned char>(s[0]))) return false;
     long nr = atol(s.c_str());
 #ifdef SYS_select
     if (nr == SYS_select) return true;

@@ -55,6 +55,7 @@ const char kUsage[] =
     "      --nvram-shape SIZE,COUNT  PRODUCT_INFO of COUNT records of SIZE bytes\n"
     "      --no-nvram              no PRODUCT_INFO store\n"
     "      --tolkd PATH            the daemon binary to run\n"
+    "      -q, --quiet             print nothing when tolkd serves\n"
     "  down --root DIR           stop tolkd, the peers and the supervisor (DIR stays)\n"
     "  at --root DIR [--adb] [--timeout SEC] [--quiet-ms MS] [--no-cr] LINE...\n"
     "                            send each LINE (followed by CR) on the host serial\n"
