@@ -15,9 +15,9 @@ while IFS= read -r hit; do
       echo "host-only include in $file: $inc"; status=1;;
   esac
 done < <(grep -rnE '^[[:space:]]*#[[:space:]]*include' src --include='*.cpp' --include='*.h')
-if grep -rnE 'TOLKD_ROOT|getenv\(' src --include='*.cpp' --include='*.h' >/dev/null; then
-  echo "host-only code in the daemon (device root or environment lookups):"
-  grep -rnE 'TOLKD_ROOT|getenv\(' src --include='*.cpp' --include='*.h'
+if grep -rnE 'TOLKD_ROOT|tolk_device_path|tolk_abstract_name|tolk_local_server' src --include='*.cpp' --include='*.h' >/dev/null; then
+  echo "host-only code in the daemon (device root lookups):"
+  grep -rnE 'TOLKD_ROOT|tolk_device_path|tolk_abstract_name|tolk_local_server' src --include='*.cpp' --include='*.h'
   status=1
 fi
 [ $status -eq 0 ] && echo "daemon sources include no host-only header"
