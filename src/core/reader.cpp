@@ -245,7 +245,10 @@ char *readline(SerialDevice *dev) {
                     fd = -1;
                 }
                 dev->fd[DEVICE_ADB] = fd;
-                slot = DEVICE_ADB;
+                // The new connection is read once select reports it readable: a
+                // host that connects and says nothing must not hold up the serial
+                // port and the modem answers.
+                continue;
             }
             buf = adbBuf;
             tolk_conn_mode = CONN_MODE_ADB;

@@ -66,6 +66,9 @@ static void routeToModem(SerialDevice *dev, const char *line) {
     if (!modemAccessAllowed(line)) {
         LOGI("%s", kUserModeRefusal);
         writeDataToSerial(kUserModeRefusal, (int)sizeof(kUserModeRefusal));
+        // A refused AT+CPIN set form was already recorded by the dispatcher; it will
+        // never be answered, so it must not lend its text to the next modem command.
+        mmiCmdSeqCancelPending();
         return;
     }
     if (s_fdRild_command < 0) connectTarget(RIL_TYPE);

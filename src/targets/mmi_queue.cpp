@@ -45,6 +45,15 @@ void mmiCmdSeqEnQueue(void) {
     gMmiCmdSeq.cusMmiCmdPending = 0;
 }
 
+void mmiCmdSeqCancelPending(void) {
+    if (gMmiCmdSeq.cusMmiCmdPending != 1) return;
+    gMmiCmdSeq.cusMmiCmdPending = 0;
+    // With the queue full the dispatcher took no text slot, so there is none to give back.
+    if (gMmiCmdSeq.seq[validIndex(gMmiCmdSeq.enSeqIdx)] != -1) return;
+    gMmiCmdSeq.EIdx = (validIndex(gMmiCmdSeq.EIdx) + MMI_QUEUE_SIZE - 1) % MMI_QUEUE_SIZE;
+    memset(gMmiCmdSeq.cmd[gMmiCmdSeq.EIdx], 0, MMI_CMD_TEXT_SIZE);
+}
+
 bool mmiCmdSeqDeQueue(void) {
     int i = validIndex(gMmiCmdSeq.deSeqIdx);
     gMmiCmdSeq.deSeqIdx = i;

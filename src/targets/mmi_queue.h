@@ -24,6 +24,9 @@ extern MmiCmdSeq gMmiCmdSeq;
 // Zeroes the record and frees every queue entry (called by initSerialDevice).
 void mmiCmdSeqReset(void);
 void mmiCmdSeqEnQueue(void);
+// Takes back the text slot of a customer MMI line that was refused before it
+// reached the modem, so that the next modem command is not paired with its text.
+void mmiCmdSeqCancelPending(void);
 bool mmiCmdSeqDeQueue(void);
 void sendCusMMICmdRspToMMI(const char *rsp);
 

@@ -189,4 +189,15 @@ TEST_F(Links, NewAdbConnectionReplacesAnOpenOne) {
     close(second);
 }
 
+TEST_F(Links, SilentAdbClientDoesNotHoldUpTheSerialPort) {
+    int adb = dev.connectAdb();
+    ASSERT_GE(adb, 0);
+    usleep(200 * 1000);  // connected, accepted, and nothing sent
+    EXPECT_EQ(visible("AT+CSDF?\n" + kCsdf), visible(dev.at("AT+CSDF?")));
+    // The quiet connection is still served once it speaks.
+    ASSERT_TRUE(writeAll(adb, "AT+CSDF?\r"));
+    EXPECT_EQ(visible(kCsdf), visible(readQuiet(adb)));
+    close(adb);
+}
+
 }  // namespace

@@ -5,6 +5,7 @@
 
 #include "core/startup.h"
 #include "host_links.h"
+#include "targets/mmi_queue.h"
 
 TEST(BootModeTest, OnlyTheFirstCharacterCounts) {
     TestRoot root;
@@ -35,6 +36,18 @@ TEST_F(UserModeGateTest, UserBuildLetsOnlyBareAtThroughUnlessSwitchedOff) {
     EXPECT_EQ(std::string::npos, route("AT+CCLK?").find("Not access"));  // local: not gated
     property_set("persist.service.tolk.usermode", "1");
     EXPECT_EQ(kNoModem, route("AT+CSQ"));
+}
+
+TEST_F(UserModeGateTest, RefusedMmiCommandLeavesNoTextForTheNextCommand) {
+    mmiCmdSeqReset();
+    property_set("ro.build.type", "user");
+    EXPECT_EQ(kRefused, route("AT+CPIN=1234"));
+    EXPECT_EQ(0, gMmiCmdSeq.cusMmiCmdPending);
+    EXPECT_EQ(0, gMmiCmdSeq.EIdx);
+    EXPECT_STREQ("", gMmiCmdSeq.cmd[0]);
+    // The next modem command that passes is an ordinary one and gets no queue entry.
+    EXPECT_EQ(kNoModem, route("AT"));
+    EXPECT_EQ(-1, gMmiCmdSeq.seq[0]);
 }
 
 TEST_F(UserModeGateTest, EngBuildIsNotGated) {
