@@ -19,6 +19,7 @@
 
 #include "cit_audio_script.h"
 #include "peers.h"
+#include "sim_text.h"
 
 namespace {
 
@@ -46,15 +47,6 @@ std::string mmiTestAnswer(const std::string &request) {
     return out;
 }
 
-// The text a script rule is compared with: a trailing NUL, then trailing CR and
-// LF bytes dropped (the daemon sends the line's delimiter or its NUL along).
-std::string matchKey(const std::string &request) {
-    std::string s = request;
-    if (!s.empty() && s.back() == '\0') s.pop_back();
-    while (!s.empty() && (s.back() == '\r' || s.back() == '\n')) s.pop_back();
-    return s;
-}
-
 void serveConnection(AudioLink *link, int conn) {
     std::vector<char> buf(64 * 1024);
     for (;;) {
@@ -62,10 +54,10 @@ void serveConnection(AudioLink *link, int conn) {
         if (n < 0 && errno == EINTR) continue;
         if (n <= 0) break;
         std::string request(buf.data(), static_cast<size_t>(n));
-        peerscript::journal(link->journalPath, std::to_string(n) + " " + peerscript::visible(request));
+        peerscript::journal(link->journalPath, std::to_string(n) + " " + sim::visibleBytes(request));
 
         peerscript::Answer answer;
-        if (!link->script.lookup(matchKey(request), &answer)) {
+        if (!link->script.lookup(sim::stripRequestEnd(request), &answer)) {
             if (request.compare(0, sizeof(kMmiTestPrefix) - 1, kMmiTestPrefix) == 0)
                 answer.bytes = mmiTestAnswer(request);
             else

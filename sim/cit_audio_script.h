@@ -1,5 +1,6 @@
 // Shared pieces of the simulated CIT test application and audio services: their
-// answer scripts, the journal rendering and the escape syntax.
+// answer scripts and the journal and socket helpers. Escapes and the journal
+// rendering are those of every peer (sim_text.h).
 //
 // Script format (one rule per line, '#' starts a comment line):
 //     KEY => ANSWER
@@ -23,9 +24,6 @@
 
 namespace peerscript {
 
-std::string unescape(const std::string &text);
-// Printable ASCII as is, backslash as \\, CR LF TAB as \r \n \t, others as \xNN.
-std::string visible(const std::string &bytes);
 // The filler of a (long N) answer.
 std::string longAnswer(const std::string &head, size_t n);
 

@@ -19,6 +19,7 @@
 
 #include "cit_audio_script.h"
 #include "peers.h"
+#include "sim_text.h"
 
 namespace {
 
@@ -34,7 +35,7 @@ struct CitPeer {
 
     // Answers one word; false when the connection is to be closed.
     bool answerWord(int conn, const std::string &word) {
-        peerscript::journal(journalPath, peerscript::visible(word));
+        peerscript::journal(journalPath, sim::visibleBytes(word));
         peerscript::Answer answer;
         if (!script.lookup(word, &answer)) answer.bytes = kDefaultAnswer;
         peerscript::sleepMs(answer.delayMs);

@@ -8,45 +8,17 @@
 #include <sys/un.h>
 #include <unistd.h>
 
-#include <cctype>
 #include <fstream>
 
 namespace tolksim {
 
 namespace {
 
-int hexValue(char c) {
-    if (c >= '0' && c <= '9') return c - '0';
-    if (c >= 'a' && c <= 'f') return c - 'a' + 10;
-    if (c >= 'A' && c <= 'F') return c - 'A' + 10;
-    return -1;
-}
-
-std::string trim(const std::string &s) {
-    size_t b = 0, e = s.size();
-    while (b < e && (s[b] == ' ' || s[b] == '\t')) b++;
-    while (e > b && (s[e - 1] == ' ' || s[e - 1] == '\t' || s[e - 1] == '\r' || s[e - 1] == '\n')) e--;
-    return s.substr(b, e - b);
-}
-
-bool equalNoCase(const std::string &a, const std::string &b, size_t n) {
-    if (a.size() < n || b.size() < n) return false;
-    for (size_t i = 0; i < n; i++) {
-        if (std::toupper(static_cast<unsigned char>(a[i])) != std::toupper(static_cast<unsigned char>(b[i])))
-            return false;
-    }
-    return true;
-}
-
 // Consumes one leading "(word [arg])" directive; false when the text does not
 // start with a known one.
 bool takeDirective(std::string *text, ScriptAnswer *ans, bool *split, bool *none, std::string *err) {
-    if (text->empty() || (*text)[0] != '(') return false;
-    size_t close = text->find(')');
-    if (close == std::string::npos) return false;
-    std::string inner = trim(text->substr(1, close - 1));
-    std::string word = inner.substr(0, inner.find(' '));
-    std::string arg = inner.size() > word.size() ? trim(inner.substr(word.size())) : std::string();
+    std::string inner, word, arg, rest;
+    if (!sim::peekDirective(*text, &inner, &word, &arg, &rest)) return false;
     if (word == "none" && arg.empty()) {
         *none = true;
     } else if (word == "split" && arg.empty()) {
@@ -56,9 +28,8 @@ bool takeDirective(std::string *text, ScriptAnswer *ans, bool *split, bool *none
     } else if (word == "close" && arg.empty()) {
         ans->close = true;
     } else if (word == "delay" || word == "gap") {
-        char *end = nullptr;
-        long v = strtol(arg.c_str(), &end, 10);
-        if (arg.empty() || *end != '\0' || v < 0 || v > 600000) {
+        long v = 0;
+        if (!sim::parseBoundedNumber(arg, 600000, &v)) {
             *err = "bad milliseconds in (" + inner + ")";
             return false;
         }
@@ -66,75 +37,14 @@ bool takeDirective(std::string *text, ScriptAnswer *ans, bool *split, bool *none
     } else {
         return false;
     }
-    *text = trim(text->substr(close + 1));
+    *text = rest;
     return true;
 }
 
 }  // namespace
 
-std::string cUnescape(const std::string &text) {
-    std::string out;
-    out.reserve(text.size());
-    for (size_t i = 0; i < text.size(); i++) {
-        char c = text[i];
-        if (c != '\\' || i + 1 >= text.size()) {
-            out += c;
-            continue;
-        }
-        char n = text[++i];
-        switch (n) {
-        case 'r': out += '\r'; break;
-        case 'n': out += '\n'; break;
-        case 't': out += '\t'; break;
-        case '0': out += '\0'; break;
-        case 'a': out += '\a'; break;
-        case 'e': out += '\x1b'; break;
-        case 'x': {
-            int v = 0, digits = 0;
-            while (digits < 2 && i + 1 < text.size() && hexValue(text[i + 1]) >= 0) {
-                v = v * 16 + hexValue(text[++i]);
-                digits++;
-            }
-            if (digits == 0) {
-                out += "\\x";
-            } else {
-                out += static_cast<char>(v);
-            }
-            break;
-        }
-        default: out += n; break;  // \\ \" \' and anything unknown
-        }
-    }
-    return out;
-}
-
-std::string visibleBytes(const std::string &bytes) {
-    static const char hex[] = "0123456789abcdef";
-    std::string out;
-    for (unsigned char c : bytes) {
-        if (c == '\\') {
-            out += "\\\\";
-        } else if (c == '\r') {
-            out += "\\r";
-        } else if (c == '\n') {
-            out += "\\n";
-        } else if (c == '\t') {
-            out += "\\t";
-        } else if (c < 0x20 || c >= 0x7f) {
-            out += "\\x";
-            out += hex[c >> 4];
-            out += hex[c & 15];
-        } else {
-            out += static_cast<char>(c);
-        }
-    }
-    return out;
-}
-
 std::string matchKey(const std::string &request) {
-    std::string s = request;
-    if (!s.empty() && s.back() == '\0') s.pop_back();
-    while (!s.empty() && (s.back() == '\r' || s.back() == '\n')) s.pop_back();
+    std::string s = sim::stripRequestEnd(request);
     size_t b = 0, e = s.size();
     while (b < e && s[b] == ' ') b++;
     while (e > b && s[e - 1] == ' ') e--;
@@ -142,25 +52,13 @@ std::string matchKey(const std::string &request) {
 }
 
 int parseScriptLine(const std::string &raw, ScriptRule *rule, std::string *err) {
-    std::string line = trim(raw);
-    if (line.empty() || line[0] == '#') return 0;
-    size_t arrow = line.find("=>");
-    if (arrow == std::string::npos) {
-        *err = "no \"=>\" in line";
-        return -1;
-    }
-    std::string key = trim(line.substr(0, arrow));
-    std::string text = trim(line.substr(arrow + 2));
-    if (key.empty()) {
-        *err = "empty command";
-        return -1;
-    }
+    sim::ScriptLine line;
+    int kind = sim::splitScriptLine(raw, "command", false, &line, err);
+    if (kind <= 0) return kind;
     ScriptRule r;
-    if (key.size() > 1 && key.back() == '*' && key[key.size() - 2] != '\\') {
-        r.prefix = true;
-        key.pop_back();
-    }
-    r.key = matchKey(cUnescape(key));
+    r.prefix = line.prefix;
+    r.key = matchKey(cUnescape(line.key));
+    std::string text = line.answer;
     bool split = false, none = false;
     std::string derr;
     while (takeDirective(&text, &r.answer, &split, &none, &derr)) {
@@ -174,7 +72,8 @@ int parseScriptLine(const std::string &raw, ScriptRule *rule, std::string *err) 
             size_t pos = 0;
             while (true) {
                 size_t bar = text.find("||", pos);
-                std::string part = trim(text.substr(pos, bar == std::string::npos ? std::string::npos : bar - pos));
+                std::string part =
+                    sim::trimBlanks(text.substr(pos, bar == std::string::npos ? std::string::npos : bar - pos));
                 r.answer.frames.push_back(cUnescape(part));
                 if (bar == std::string::npos) break;
                 pos = bar + 2;
@@ -223,8 +122,7 @@ bool ScriptFile::lookup(const std::string &request, ScriptAnswer *out) {
     if (!present_) return false;
     std::string key = matchKey(request);
     for (const ScriptRule &r : rules_) {
-        bool hit = r.prefix ? equalNoCase(key, r.key, r.key.size())
-                            : key.size() == r.key.size() && equalNoCase(key, r.key, key.size());
+        bool hit = r.prefix ? sim::startsWithNoCase(key, r.key) : sim::equalsNoCase(key, r.key);
         if (hit) {
             *out = r.answer;
             return true;

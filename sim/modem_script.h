@@ -10,14 +10,15 @@
 #include <string>
 #include <vector>
 
+#include "sim_text.h"
+
 namespace tolksim {
 
 // Interprets \r \n \t \0 \a \e \\ \" \' and \xNN (one or two hex digits). An
 // unknown escape keeps its character; a lone trailing backslash stays as is.
-std::string cUnescape(const std::string &text);
-// Renders bytes on one line: printable ASCII as is, backslash as \\, CR/LF/TAB as
-// \r \n \t, every other byte as \xNN (so NUL is \x00 and Ctrl-Z is \x1a).
-std::string visibleBytes(const std::string &bytes);
+inline std::string cUnescape(const std::string &text) { return sim::decodeScriptEscapes(text, true); }
+// Journals render bytes on one line, as every peer does.
+using sim::visibleBytes;
 
 // What a script rule answers.
 struct ScriptAnswer {

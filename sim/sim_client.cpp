@@ -12,6 +12,7 @@
 #include <cstdio>
 #include <cstring>
 
+#include "sim_text.h"
 #include "sim_util.h"
 
 namespace sim {

@@ -1,6 +1,6 @@
 // Shared pieces of the tolk-sim subcommands: the device-root layout, small file
-// helpers, the escape syntax of command-line texts, and the supervisor's control
-// socket protocol.
+// helpers and the supervisor's control socket protocol. The escape syntax of
+// command-line texts is in sim_text.h.
 #ifndef TOLK_SIM_UTIL_H
 #define TOLK_SIM_UTIL_H
 
@@ -44,12 +44,6 @@ std::string readFileOr(const std::string &path, const std::string &fallback = ""
 bool fileExists(const std::string &path);
 // The last n lines of a file (for failure reports).
 std::string tailLines(const std::string &path, int n);
-
-// Decodes the escapes of a command-line text: \r \n \t \b \e \\ \xNN \0.
-// Returns false (with a message in err) for a malformed escape.
-bool decodeEscapes(const std::string &in, std::string *out, std::string *err);
-// Renders bytes readably, the inverse of decodeEscapes.
-std::string visibleBytes(const std::string &bytes);
 
 // True when a process with this pid exists and its environment names this
 // device root (TOLKD_ROOT=root): the guard against signalling a recycled pid.

@@ -17,6 +17,7 @@
 #include "peers.h"
 #include "sim_client.h"
 #include "sim_device.h"
+#include "sim_text.h"
 #include "sim_util.h"
 
 namespace {
