@@ -88,7 +88,9 @@ SimDevice::SimDevice(const std::vector<std::string> &upArgs) {
         return;
     }
     root_ = tmpl;
-    std::vector<std::string> args = {"up", "--root", root_, "--tolkd", TOLKD_BINARY};
+    // TOLK_E2E_TOLKD runs the daemon through something else, e.g. a valgrind wrapper.
+    const char *tolkd = getenv("TOLK_E2E_TOLKD");
+    std::vector<std::string> args = {"up", "--root", root_, "--tolkd", tolkd && *tolkd ? tolkd : TOLKD_BINARY};
     args.insert(args.end(), upArgs.begin(), upArgs.end());
     upStatus_ = runSim(args, &upOutput_, true);
 }
