@@ -12,6 +12,7 @@
 #include <errno.h>
 #include <fcntl.h>
 #include <limits.h>
+#include <pthread.h>
 #include <stdarg.h>
 #include <stdio.h>
 #include <stdlib.h>
@@ -20,6 +21,7 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <mutex>
 #include <string>
 #include <vector>
@@ -139,6 +141,34 @@ int dest_fd(LogState &s, const std::string &dest) {
     return s.fd;
 }
 
+// The ids in every line's header. Each getpid()/gettid() is a system call on the
+// host, two per line, while on the phone liblog reads both from libc's cache; so
+// they are cached here too: the pid per process, the tid per thread, both dropped
+// in a forked child, whose ids differ from its parent's.
+std::atomic<pid_t> gPid{0};
+thread_local pid_t tTid = 0;
+
+void forget_ids_in_child() {
+    gPid.store(0);
+    tTid = 0;
+}
+
+pid_t cached_pid() {
+    static std::once_flag atforkOnce;
+    std::call_once(atforkOnce, [] { pthread_atfork(nullptr, nullptr, forget_ids_in_child); });
+    pid_t pid = gPid.load(std::memory_order_relaxed);
+    if (pid == 0) {
+        pid = getpid();
+        gPid.store(pid, std::memory_order_relaxed);
+    }
+    return pid;
+}
+
+pid_t cached_tid() {
+    if (tTid == 0) tTid = static_cast<pid_t>(syscall(SYS_gettid));
+    return tTid;
+}
+
 void write_all(int fd, const char *p, size_t len) {
     while (len > 0) {
         ssize_t n = write(fd, p, len);
@@ -183,7 +213,7 @@ extern "C" int __android_log_print(int prio, const char *tag, const char *fmt, .
     char head[128];
     int hlen = snprintf(head, sizeof(head), "%02d-%02d %02d:%02d:%02d.%03ld %5d %5ld %c %s: ", tm.tm_mon + 1,
                         tm.tm_mday, tm.tm_hour, tm.tm_min, tm.tm_sec, ts.tv_nsec / 1000000L,
-                        static_cast<int>(getpid()), static_cast<long>(syscall(SYS_gettid)), prio_char(prio), tag);
+                        static_cast<int>(cached_pid()), static_cast<long>(cached_tid()), prio_char(prio), tag);
     if (hlen < 0) hlen = 0;
     if (static_cast<size_t>(hlen) >= sizeof(head)) hlen = sizeof(head) - 1;
 
