@@ -20,6 +20,7 @@
 #include "cit_audio_script.h"
 #include "peers.h"
 #include "sim_text.h"
+#include "sim_util.h"
 
 namespace {
 
@@ -54,7 +55,7 @@ void serveConnection(AudioLink *link, int conn) {
         if (n < 0 && errno == EINTR) continue;
         if (n <= 0) break;
         std::string request(buf.data(), static_cast<size_t>(n));
-        peerscript::journal(link->journalPath, std::to_string(n) + " " + sim::visibleBytes(request));
+        sim::journalLine(link->journalPath, std::to_string(n) + " " + sim::visibleBytes(request));
 
         peerscript::Answer answer;
         if (!link->script.lookup(sim::stripRequestEnd(request), &answer)) {
@@ -63,10 +64,10 @@ void serveConnection(AudioLink *link, int conn) {
             else
                 answer.bytes = kDefaultAnswer;
         }
-        peerscript::sleepMs(answer.delayMs);
+        sim::sleepMs(answer.delayMs);
         if (answer.close) break;
         if (answer.none) continue;
-        if (!peerscript::sendAll(conn, answer.bytes)) break;
+        if (!sim::sendAll(conn, answer.bytes)) break;
     }
     close(conn);
 }

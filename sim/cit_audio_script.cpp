@@ -1,14 +1,6 @@
 #include "cit_audio_script.h"
 
-#include <errno.h>
-#include <fcntl.h>
-#include <sys/socket.h>
-#include <time.h>
-#include <unistd.h>
-
 #include <fstream>
-
-#include <tolk_platform/file_util.h>
 
 #include "sim_text.h"
 
@@ -71,31 +63,6 @@ bool Script::lookup(const std::string &key, Answer *out) const {
         }
     }
     return false;
-}
-
-void journal(const std::string &path, const std::string &line) {
-    std::string text = line + "\n";
-    tolk_append_file(path.c_str(), text.data(), text.size());
-}
-
-bool sendAll(int fd, const std::string &bytes) {
-    size_t off = 0;
-    while (off < bytes.size()) {
-        ssize_t n = send(fd, bytes.data() + off, bytes.size() - off, MSG_NOSIGNAL);
-        if (n < 0) {
-            if (errno == EINTR) continue;
-            return false;
-        }
-        off += static_cast<size_t>(n);
-    }
-    return true;
-}
-
-void sleepMs(int ms) {
-    if (ms <= 0) return;
-    struct timespec ts = {ms / 1000, (ms % 1000) * 1000000L};
-    while (nanosleep(&ts, &ts) != 0 && errno == EINTR) {
-    }
 }
 
 }  // namespace peerscript

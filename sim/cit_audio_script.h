@@ -1,6 +1,6 @@
 // Shared pieces of the simulated CIT test application and audio services: their
-// answer scripts and the journal and socket helpers. Escapes and the journal
-// rendering are those of every peer (sim_text.h).
+// answer scripts. Escapes, the journal rendering (sim_text.h) and the socket
+// helpers (sim_util.h) are those of every peer.
 //
 // Script format (one rule per line, '#' starts a comment line):
 //     KEY => ANSWER
@@ -54,12 +54,6 @@ public:
 private:
     std::string path_;
 };
-
-// Appends one line to a journal file (one write, O_APPEND), creating its folder.
-void journal(const std::string &path, const std::string &line);
-// Writes all bytes, retrying short writes and EINTR, never raising SIGPIPE.
-bool sendAll(int fd, const std::string &bytes);
-void sleepMs(int ms);
 
 }  // namespace peerscript
 

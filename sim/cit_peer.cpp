@@ -20,6 +20,7 @@
 #include "cit_audio_script.h"
 #include "peers.h"
 #include "sim_text.h"
+#include "sim_util.h"
 
 namespace {
 
@@ -35,13 +36,13 @@ struct CitPeer {
 
     // Answers one word; false when the connection is to be closed.
     bool answerWord(int conn, const std::string &word) {
-        peerscript::journal(journalPath, sim::visibleBytes(word));
+        sim::journalLine(journalPath, sim::visibleBytes(word));
         peerscript::Answer answer;
         if (!script.lookup(word, &answer)) answer.bytes = kDefaultAnswer;
-        peerscript::sleepMs(answer.delayMs);
+        sim::sleepMs(answer.delayMs);
         if (answer.close) return false;
         if (answer.none) return true;
-        return peerscript::sendAll(conn, answer.bytes);
+        return sim::sendAll(conn, answer.bytes);
     }
 
     void serveConnection(int conn) {

@@ -25,9 +25,6 @@ namespace {
 
 const char kServiceName[] = "tolk-service";
 const char kMmiMark[] = "+ORVTOLKJ";
-volatile sig_atomic_t gStop = 0;
-
-void onTerm(int) { gStop = 1; }
 
 struct Pending {
     int fd;
@@ -82,7 +79,7 @@ void GenericService::receive(int fd) {
         if (msg.find(kMmiMark) != std::string::npos) return;
         sa.frames.push_back("\r\nOK\r\n");
     }
-    long long now = monoMs();
+    long long now = nowMs();
     if (sa.close) {
         pending_.push_back(Pending{fd, now + sa.delayMs, sa.hold, true, ""});
         return;
@@ -93,7 +90,7 @@ void GenericService::receive(int fd) {
 }
 
 void GenericService::deliverDue() {
-    long long now = monoMs();
+    long long now = nowMs();
     std::string release = root_ + "/sim/generic/release";
     bool released = access(release.c_str(), F_OK) == 0;
     if (released) unlink(release.c_str());
@@ -117,12 +114,12 @@ int GenericService::run() {
         fprintf(stderr, "generic: cannot serve %s: %s\n", socketPath_.c_str(), strerror(errno));
         return 1;
     }
-    while (!gStop) {
+    while (!sim::stopRequested()) {
         std::vector<struct pollfd> fds;
         fds.push_back({listenFd_, POLLIN, 0});
         for (int c : clients_) fds.push_back({c, POLLIN, 0});
         int timeout = 100;
-        long long now = monoMs();
+        long long now = nowMs();
         for (const Pending &p : pending_) {
             if (p.hold) timeout = std::min(timeout, 20);
             timeout = static_cast<int>(std::max(0LL, std::min<long long>(timeout, p.due - now)));
@@ -159,12 +156,7 @@ int run_generic_peer(const std::string &root, const std::vector<std::string> &ar
             return 2;
         }
     }
-    struct sigaction sa;
-    memset(&sa, 0, sizeof sa);
-    sa.sa_handler = onTerm;
-    sigaction(SIGTERM, &sa, nullptr);
-    sigaction(SIGINT, &sa, nullptr);
-    signal(SIGPIPE, SIG_IGN);
+    sim::watchStopSignals();
     // The socket helpers resolve device paths under TOLKD_ROOT; tolk-sim sets it,
     // a peer started by hand may not.
     setenv("TOLKD_ROOT", root.c_str(), 1);

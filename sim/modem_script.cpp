@@ -1,13 +1,10 @@
 #include "modem_script.h"
 
 #include <errno.h>
-#include <fcntl.h>
 #include <string.h>
-#include <sys/socket.h>
 #include <sys/stat.h>
-#include <sys/un.h>
-#include <unistd.h>
 
+#include <cstdio>
 #include <fstream>
 
 namespace tolksim {
@@ -131,78 +128,16 @@ bool ScriptFile::lookup(const std::string &request, ScriptAnswer *out) {
     return false;
 }
 
-void makeDirs(const std::string &path) {
-    for (size_t pos = 1; pos <= path.size(); pos++) {
-        if (pos == path.size() || path[pos] == '/') mkdir(path.substr(0, pos).c_str(), 0755);
-    }
-}
-
-void journalLine(const std::string &path, const std::string &line) {
-    size_t slash = path.rfind('/');
-    if (slash != std::string::npos) makeDirs(path.substr(0, slash));
-    int fd = open(path.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
-    if (fd < 0) return;
-    std::string text = line + "\n";
-    sendAll(fd, text.data(), text.size());
-    close(fd);
-}
-
 int listenUnix(const std::string &path, int backlog) {
-    struct sockaddr_un addr;
-    memset(&addr, 0, sizeof addr);
-    addr.sun_family = AF_UNIX;
-    if (path.size() >= sizeof addr.sun_path) {
+    if (!sim::fitsSocketPath(path)) {
         fprintf(stderr, "socket path too long: %s\n", path.c_str());
         return -1;
     }
-    memcpy(addr.sun_path, path.c_str(), path.size());
     size_t slash = path.rfind('/');
-    if (slash != std::string::npos) makeDirs(path.substr(0, slash));
-    unlink(path.c_str());
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    if (fd < 0) return -1;
-    if (bind(fd, reinterpret_cast<struct sockaddr *>(&addr), sizeof addr) != 0 || listen(fd, backlog) != 0) {
-        fprintf(stderr, "cannot listen on %s: %s\n", path.c_str(), strerror(errno));
-        close(fd);
-        return -1;
-    }
+    if (slash != std::string::npos) sim::makeDirs(path.substr(0, slash));
+    int fd = sim::bindUnix(path, backlog);
+    if (fd < 0) fprintf(stderr, "cannot listen on %s: %s\n", path.c_str(), strerror(errno));
     return fd;
-}
-
-int connectUnix(const std::string &path) {
-    struct sockaddr_un addr;
-    memset(&addr, 0, sizeof addr);
-    addr.sun_family = AF_UNIX;
-    if (path.size() >= sizeof addr.sun_path) return -1;
-    memcpy(addr.sun_path, path.c_str(), path.size());
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    if (fd < 0) return -1;
-    if (connect(fd, reinterpret_cast<struct sockaddr *>(&addr), sizeof addr) != 0) {
-        close(fd);
-        return -1;
-    }
-    return fd;
-}
-
-bool sendAll(int fd, const void *data, size_t len) {
-    const char *p = static_cast<const char *>(data);
-    while (len > 0) {
-        ssize_t n = send(fd, p, len, MSG_NOSIGNAL);
-        if (n < 0 && errno == ENOTSOCK) n = write(fd, p, len);
-        if (n < 0) {
-            if (errno == EINTR) continue;
-            return false;
-        }
-        p += n;
-        len -= static_cast<size_t>(n);
-    }
-    return true;
-}
-
-long long monoMs() {
-    struct timespec ts;
-    clock_gettime(CLOCK_MONOTONIC, &ts);
-    return static_cast<long long>(ts.tv_sec) * 1000 + ts.tv_nsec / 1000000;
 }
 
 std::string underRoot(const std::string &root, const std::string &devicePath) {

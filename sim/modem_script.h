@@ -1,6 +1,5 @@
 // Shared pieces of the simulated radio and generic services: the answer script
-// (a small line format that overrides or adds answers), C-escape handling, the
-// journal rendering and AF_UNIX helpers. Host tool code: modern C++ is fine here.
+// (a small line format that overrides or adds answers) and the socket helpers. Host tool code: modern C++ is fine here.
 #ifndef TOLK_SIM_MODEM_SCRIPT_H
 #define TOLK_SIM_MODEM_SCRIPT_H
 
@@ -11,6 +10,7 @@
 #include <vector>
 
 #include "sim_text.h"
+#include "sim_util.h"
 
 namespace tolksim {
 
@@ -59,19 +59,15 @@ private:
     std::vector<ScriptRule> rules_;
 };
 
-// Appends one line (text + "\n") to a journal file, creating its folder.
-void journalLine(const std::string &path, const std::string &line);
-// mkdir -p.
-void makeDirs(const std::string &path);
-// Binds and listens on an AF_UNIX stream socket at path (an old file is removed).
-// Returns the descriptor or -1.
+// Binds and listens on an AF_UNIX stream socket at path (an old file is removed,
+// missing folders are made). Returns the descriptor or -1, saying why on stderr.
 int listenUnix(const std::string &path, int backlog = 4);
-// Connects to an AF_UNIX stream socket; descriptor or -1.
-int connectUnix(const std::string &path);
-// Writes all bytes (retrying EINTR and short writes, never raising SIGPIPE).
-bool sendAll(int fd, const void *data, size_t len);
-// Milliseconds of a monotonic clock.
-long long monoMs();
+// The file, socket and clock helpers of all tolk-sim.
+using sim::connectUnix;
+using sim::journalLine;
+using sim::makeDirs;
+using sim::nowMs;
+using sim::sendAll;
 // The device path resolved under root: root + path.
 std::string underRoot(const std::string &root, const std::string &devicePath);
 

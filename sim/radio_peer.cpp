@@ -27,9 +27,6 @@ namespace {
 
 const int kSlots = 4;
 const int kIndicationUnsolicited = 0;
-volatile sig_atomic_t gStop = 0;
-
-void onTerm(int) { gStop = 1; }
 
 bool wireSend(int fd, uint32_t type, int32_t serial, int32_t extra, const std::string &payload) {
     return radio_wire_send(fd, type, serial, extra, payload.data(), static_cast<uint32_t>(payload.size())) == 0;
@@ -145,7 +142,7 @@ void RadioService::answer(Slot &s, unsigned id, int32_t serial, const std::strin
         if (!s.modem->handle(request, &text)) return;
         sa.frames.push_back(text);
     }
-    long long now = monoMs();
+    long long now = nowMs();
     if (sa.close) {
         pending_.push_back(Pending{s.number, id, now + sa.delayMs, sa.hold, true, 0, serial, ""});
         return;
@@ -241,7 +238,7 @@ void RadioService::serveControl() {
 }
 
 void RadioService::deliverDue() {
-    long long now = monoMs();
+    long long now = nowMs();
     std::string release = root_ + "/sim/radio/release";
     bool released = access(release.c_str(), F_OK) == 0;
     if (released) unlink(release.c_str());
@@ -267,7 +264,7 @@ void RadioService::deliverDue() {
 
 int RadioService::pollTimeout() const {
     int timeout = 100;
-    long long now = monoMs();
+    long long now = nowMs();
     for (const Pending &p : pending_) {
         if (p.hold) timeout = std::min(timeout, 20);
         long long left = p.due - now;
@@ -291,7 +288,7 @@ int RadioService::run() {
     if (ctlFd_ < 0) return 1;
     openTty();
 
-    while (!gStop) {
+    while (!sim::stopRequested()) {
         std::vector<struct pollfd> fds;
         std::vector<std::pair<int, unsigned>> what;  // (slot index, client id or 0 for the listener); -1 ctl, -2 tty
         for (int i = 0; i < kSlots; i++) {
@@ -351,12 +348,7 @@ int run_radio_peer(const std::string &root, const std::vector<std::string> &args
             return 2;
         }
     }
-    struct sigaction sa;
-    memset(&sa, 0, sizeof sa);
-    sa.sa_handler = onTerm;
-    sigaction(SIGTERM, &sa, nullptr);
-    sigaction(SIGINT, &sa, nullptr);
-    signal(SIGPIPE, SIG_IGN);
+    sim::watchStopSignals();
     RadioService service(root, modemTty);
     return service.run();
 }

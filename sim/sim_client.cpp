@@ -41,18 +41,13 @@ int openLink(const std::string &root, bool adb, std::string *err) {
     RootLayout L{root};
     if (adb) {
         std::string path = L.adbSocket();
-        struct sockaddr_un addr;
-        memset(&addr, 0, sizeof addr);
-        addr.sun_family = AF_UNIX;
-        if (path.size() >= sizeof addr.sun_path) {
+        if (!fitsSocketPath(path)) {
             *err = "socket path too long: " + path;
             return -1;
         }
-        memcpy(addr.sun_path, path.c_str(), path.size());
-        int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        if (fd < 0 || connect(fd, reinterpret_cast<struct sockaddr *>(&addr), sizeof addr) != 0) {
+        int fd = connectUnix(path);
+        if (fd < 0) {
             *err = "cannot connect to " + path + ": " + strerror(errno);
-            if (fd >= 0) close(fd);
             return -1;
         }
         fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) | O_NONBLOCK);

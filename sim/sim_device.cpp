@@ -53,32 +53,6 @@ std::string shellQuote(const std::string &s) {
     return out + "'";
 }
 
-bool fitsSocketPath(const std::string &path) {
-    return path.size() < sizeof(((struct sockaddr_un *)nullptr)->sun_path);
-}
-
-int bindUnix(const std::string &path, bool listening, bool cloexec) {
-    struct sockaddr_un addr;
-    memset(&addr, 0, sizeof addr);
-    addr.sun_family = AF_UNIX;
-    if (!fitsSocketPath(path)) {
-        errno = ENAMETOOLONG;
-        return -1;
-    }
-    memcpy(addr.sun_path, path.c_str(), path.size());
-    int fd = socket(AF_UNIX, SOCK_STREAM | (cloexec ? SOCK_CLOEXEC : 0), 0);
-    if (fd < 0) return -1;
-    unlink(path.c_str());
-    if (bind(fd, reinterpret_cast<struct sockaddr *>(&addr), sizeof addr) != 0 ||
-        (listening && listen(fd, 8) != 0)) {
-        int e = errno;
-        close(fd);
-        errno = e;
-        return -1;
-    }
-    return fd;
-}
-
 // A pseudo-terminal pair: the master and an open descriptor on its slave.
 struct PtyPair {
     int master = -1;
@@ -274,7 +248,7 @@ bool Supervisor::setUp(std::string *err) {
     if (opt_.controlSocket) {
         // Bound, not listening: like init, which leaves listen() to the service.
         // No CLOEXEC: tolkd inherits it.
-        adbFd_ = bindUnix(L_.adbSocket(), false, false);
+        adbFd_ = bindUnix(L_.adbSocket(), -1, false);
         if (adbFd_ < 0) {
             *err = "cannot create the control socket " + L_.adbSocket() + ": " + strerror(errno);
             return false;
@@ -282,7 +256,7 @@ bool Supervisor::setUp(std::string *err) {
     } else {
         unlink(L_.adbSocket().c_str());
     }
-    ctlFd_ = bindUnix(L_.ctlSocket(), true, true);
+    ctlFd_ = bindUnix(L_.ctlSocket(), 8);
     if (ctlFd_ < 0) {
         *err = "cannot create " + L_.ctlSocket() + ": " + strerror(errno);
         return false;

@@ -15,6 +15,8 @@
 #include <fstream>
 #include <sstream>
 
+#include <tolk_platform/file_util.h>
+
 namespace sim {
 
 const std::vector<std::string> &peerNames() {
@@ -110,6 +112,86 @@ std::string tailLines(const std::string &path, int n) {
     return s.substr(pos);
 }
 
+void journalLine(const std::string &path, const std::string &line) {
+    std::string text = line + "\n";
+    tolk_append_file(path.c_str(), text.data(), text.size());
+}
+
+bool fitsSocketPath(const std::string &path) {
+    return path.size() < sizeof(((struct sockaddr_un *)nullptr)->sun_path);
+}
+
+static bool unixAddress(const std::string &path, struct sockaddr_un *addr) {
+    memset(addr, 0, sizeof *addr);
+    addr->sun_family = AF_UNIX;
+    if (!fitsSocketPath(path)) {
+        errno = ENAMETOOLONG;
+        return false;
+    }
+    memcpy(addr->sun_path, path.c_str(), path.size());
+    return true;
+}
+
+int bindUnix(const std::string &path, int backlog, bool cloexec) {
+    struct sockaddr_un addr;
+    if (!unixAddress(path, &addr)) return -1;
+    int fd = socket(AF_UNIX, SOCK_STREAM | (cloexec ? SOCK_CLOEXEC : 0), 0);
+    if (fd < 0) return -1;
+    unlink(path.c_str());
+    if (bind(fd, reinterpret_cast<struct sockaddr *>(&addr), sizeof addr) != 0 ||
+        (backlog >= 0 && listen(fd, backlog) != 0)) {
+        int e = errno;
+        close(fd);
+        errno = e;
+        return -1;
+    }
+    return fd;
+}
+
+int connectUnix(const std::string &path) {
+    struct sockaddr_un addr;
+    if (!unixAddress(path, &addr)) return -1;
+    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    if (fd < 0) return -1;
+    if (connect(fd, reinterpret_cast<struct sockaddr *>(&addr), sizeof addr) != 0) {
+        int e = errno;
+        close(fd);
+        errno = e;
+        return -1;
+    }
+    return fd;
+}
+
+bool sendAll(int fd, const void *data, size_t len) {
+    const char *p = static_cast<const char *>(data);
+    while (len > 0) {
+        ssize_t n = send(fd, p, len, MSG_NOSIGNAL);
+        if (n < 0 && errno == ENOTSOCK) n = write(fd, p, len);
+        if (n < 0) {
+            if (errno == EINTR) continue;
+            return false;
+        }
+        p += n;
+        len -= static_cast<size_t>(n);
+    }
+    return true;
+}
+
+static volatile sig_atomic_t gStopRequested = 0;
+
+static void onStopSignal(int) { gStopRequested = 1; }
+
+void watchStopSignals() {
+    struct sigaction sa;
+    memset(&sa, 0, sizeof sa);
+    sa.sa_handler = onStopSignal;
+    sigaction(SIGTERM, &sa, nullptr);
+    sigaction(SIGINT, &sa, nullptr);
+    signal(SIGPIPE, SIG_IGN);
+}
+
+bool stopRequested() { return gStopRequested != 0; }
+
 bool processBelongsToRoot(pid_t pid, const std::string &root) {
     if (pid <= 1) return false;
     std::string env;
@@ -137,18 +219,8 @@ pid_t readPidFile(const std::string &path) {
 
 bool controlRequest(const std::string &root, const std::string &command, std::string *answer,
                     int timeoutMs) {
-    std::string path = RootLayout{root}.ctlSocket();
-    struct sockaddr_un addr;
-    memset(&addr, 0, sizeof addr);
-    addr.sun_family = AF_UNIX;
-    if (path.size() >= sizeof addr.sun_path) return false;
-    memcpy(addr.sun_path, path.c_str(), path.size());
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    int fd = connectUnix(RootLayout{root}.ctlSocket());
     if (fd < 0) return false;
-    if (connect(fd, reinterpret_cast<struct sockaddr *>(&addr), sizeof addr) != 0) {
-        close(fd);
-        return false;
-    }
     std::string line = command + "\n";
     if (write(fd, line.data(), line.size()) != static_cast<ssize_t>(line.size())) {
         close(fd);

@@ -1,5 +1,5 @@
-// Shared pieces of the tolk-sim subcommands: the device-root layout, small file
-// helpers and the supervisor's control socket protocol. The escape syntax of
+// Shared pieces of tolk-sim and its peers: the device-root layout, small file,
+// socket and clock helpers, and the supervisor's control socket protocol. The escape syntax of
 // command-line texts is in sim_text.h.
 #ifndef TOLK_SIM_UTIL_H
 #define TOLK_SIM_UTIL_H
@@ -44,6 +44,30 @@ std::string readFileOr(const std::string &path, const std::string &fallback = ""
 bool fileExists(const std::string &path);
 // The last n lines of a file (for failure reports).
 std::string tailLines(const std::string &path, int n);
+
+// Appends one line (text + "\n") to a journal file with one write, creating its
+// folders, so lines of concurrent writers never mix.
+void journalLine(const std::string &path, const std::string &line);
+
+// Whether path fits into an AF_UNIX socket address.
+bool fitsSocketPath(const std::string &path);
+// A stream socket bound to path (an old socket file there is removed first) and,
+// for backlog >= 0, listening. The descriptor, or -1 with errno (ENAMETOOLONG for
+// a path that does not fit).
+int bindUnix(const std::string &path, int backlog, bool cloexec = true);
+// A stream connection to the AF_UNIX socket at path; the descriptor, or -1 with
+// errno.
+int connectUnix(const std::string &path);
+// Writes all bytes, retrying EINTR and short writes, never raising SIGPIPE (a
+// descriptor that is no socket, such as a tty, is written to plainly).
+bool sendAll(int fd, const void *data, size_t len);
+inline bool sendAll(int fd, const std::string &bytes) { return sendAll(fd, bytes.data(), bytes.size()); }
+
+// A peer runs until SIGTERM or SIGINT: after watchStopSignals(), stopRequested()
+// turns true at either. SIGPIPE is ignored, so a client that went away shows as a
+// failed write rather than ending the peer.
+void watchStopSignals();
+bool stopRequested();
 
 // True when a process with this pid exists and its environment names this
 // device root (TOLKD_ROOT=root): the guard against signalling a recycled pid.

@@ -5,3 +5,4 @@
 #include "../../../sim/modem_sim.cpp"
 #include "../../../sim/radio_peer.cpp"
 #include "../../../sim/sim_text.cpp"
+#include "../../../sim/sim_util.cpp"
