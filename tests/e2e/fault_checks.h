@@ -4,6 +4,7 @@
 #ifndef TOLK_TESTS_E2E_FAULT_CHECKS_H
 #define TOLK_TESTS_E2E_FAULT_CHECKS_H
 
+#include <dirent.h>
 #include <unistd.h>
 
 #include <fstream>
@@ -22,6 +23,21 @@ inline int countOf(const std::string &text, const std::string &needle) {
     int n = 0;
     for (size_t pos = text.find(needle); pos != std::string::npos; pos = text.find(needle, pos + needle.size())) n++;
     return n;
+}
+
+// What the daemon's descriptors point to, for failure messages.
+inline std::string tolkdFdList(const SimDevice &d) {
+    std::string dir = "/proc/" + std::to_string(d.tolkdPid()) + "/fd", out;
+    if (DIR *dp = opendir(dir.c_str())) {
+        while (struct dirent *e = readdir(dp)) {
+            if (e->d_name[0] == '.') continue;
+            char target[512];
+            ssize_t n = readlink((dir + "/" + e->d_name).c_str(), target, sizeof target - 1);
+            out += std::string(e->d_name) + "->" + std::string(target, n > 0 ? static_cast<size_t>(n) : 0) + " ";
+        }
+        closedir(dp);
+    }
+    return out;
 }
 
 // A connection the host has just dropped is closed by the daemon only when it
@@ -65,7 +81,7 @@ inline void expectServing(SimDevice &d, int fdsBefore, const char *when) {
     std::string serial = d.at("AT+CSDF?");
     EXPECT_NE(std::string::npos, serial.find(kCsdfAnswer)) << "serial: " << visible(serial);
     EXPECT_EQ(visible(kCsdfAnswer), visible(d.at("AT+CSDF?", true)));
-    EXPECT_EQ(fdsBefore, settledFdCount(d, fdsBefore)) << "descriptors leaked or lost";
+    EXPECT_EQ(fdsBefore, settledFdCount(d, fdsBefore)) << "descriptors leaked or lost: " << tolkdFdList(d);
 }
 
 }  // namespace fault_checks
