@@ -14,32 +14,6 @@
 #include "cit/cit_cmd.h"
 #include "serial/serial_device.h"
 
-HostLink::HostLink() {
-    int sv[2];
-    if (socketpair(AF_UNIX, SOCK_STREAM, 0, sv) != 0) throw std::runtime_error("socketpair");
-    host_ = sv[0];
-    device_ = sv[1];
-    gSerialDevice.fd[DEVICE_SERIAL] = device_;
-    gSerialDevice.currDevice = DEVICE_SERIAL;
-}
-
-HostLink::~HostLink() {
-    gSerialDevice.fd[DEVICE_SERIAL] = -1;
-    close(host_);
-    close(device_);
-}
-
-std::string HostLink::take() {
-    std::string out;
-    char buf[4096];
-    for (;;) {
-        ssize_t n = recv(host_, buf, sizeof(buf), MSG_DONTWAIT);
-        if (n <= 0) break;
-        out.append(buf, static_cast<size_t>(n));
-    }
-    return out;
-}
-
 FakeTestApp::FakeTestApp() {
     listen_ = tolk_local_server(CIT_SOCKET_NAME, ANDROID_SOCKET_NAMESPACE_ABSTRACT, SOCK_STREAM, 4);
     if (listen_ < 0) throw std::runtime_error("cannot serve the test application socket");

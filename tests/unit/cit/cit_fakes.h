@@ -1,5 +1,6 @@
-// Test doubles for the CIT unit tests: the host end of the serial link, and a test
-// application served on the same abstract socket the daemon connects to.
+// Test doubles for the CIT unit tests: a test application served on the same
+// abstract socket the daemon connects to. The host end of the serial link is
+// the shared HostCapture.
 #ifndef TOLK_TESTS_UNIT_CIT_FAKES_H
 #define TOLK_TESTS_UNIT_CIT_FAKES_H
 
@@ -10,19 +11,7 @@
 #include <utility>
 #include <vector>
 
-// Points the serial slot of gSerialDevice at one end of a socket pair and reads
-// what the daemon wrote from the other end.
-class HostLink {
-public:
-    HostLink();
-    ~HostLink();
-    // Everything written since the last call.
-    std::string take();
-
-private:
-    int host_ = -1;
-    int device_ = -1;
-};
+#include "host_capture.h"
 
 // The on-device test application: one word per NUL, answers by word.
 class FakeTestApp {

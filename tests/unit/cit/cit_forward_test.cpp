@@ -29,7 +29,7 @@ protected:
     }
 
     TestRoot root_;
-    HostLink host_;
+    HostCapture host_;
 };
 
 TEST(CitCheck, ClaimsEveryCaseOfTheCitPrefixAndNothingElse) {

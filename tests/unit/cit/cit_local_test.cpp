@@ -41,7 +41,7 @@ protected:
     }
 
     TestRoot root_;
-    HostLink host_;
+    HostCapture host_;
 };
 
 // Each fixed flag has two known values and shows nothing for any other.

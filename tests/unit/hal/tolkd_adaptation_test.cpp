@@ -17,6 +17,7 @@
 #include "dispatch/dispatcher.h"
 #include "hal/tolkd_adaptation.h"
 #include "hal/tolkd_adaptation_impl.h"
+#include "host_capture.h"
 #include "serial/response_writer.h"
 #include "serial/serial_device.h"
 #include "targets/target_conn.h"
@@ -34,21 +35,6 @@ bool eventually(const std::function<bool()> &cond, int ms = 3000) {
     return cond();
 }
 
-// Everything a descriptor delivers within ms, once it stays quiet.
-std::string drain(int fd, int ms = 300) {
-    std::string out;
-    char buf[8192];
-    for (;;) {
-        pollfd p{fd, POLLIN, 0};
-        if (poll(&p, 1, ms) <= 0) break;
-        ssize_t n = recv(fd, buf, sizeof(buf), MSG_DONTWAIT);
-        if (n <= 0) break;
-        out.append(buf, static_cast<size_t>(n));
-        ms = 50;
-    }
-    return out;
-}
-
 bool slotEmpty(int slot) {
     pthread_mutex_lock(&gTolkdAdaptation->mMutex);
     bool empty = gTolkdAdaptation->mRadio[slot] == nullptr;
@@ -61,12 +47,7 @@ bool slotEmpty(int slot) {
 class HalBridge : public ::testing::Test {
 protected:
     void SetUp() override {
-        int host[2];
-        ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM, 0, host));
-        hostFd_ = host[1];
-        gSerialDevice.fd[DEVICE_SERIAL] = host[0];
-        gSerialDevice.currDevice = DEVICE_SERIAL;
-        gNumericMode = false;
+        ASSERT_TRUE(host_.ok());
         isATCmdInject = false;
         isMsgCmdInput = false;
         s_fdRild_command = -1;
@@ -78,16 +59,13 @@ protected:
     void TearDown() override {
         // Proxies point at this test's services; the next test starts without them.
         gTolkdAdaptation->serviceDied();
-        close(gSerialDevice.fd[DEVICE_SERIAL]);
-        gSerialDevice.fd[DEVICE_SERIAL] = -1;
-        close(hostFd_);
         close(s_fdRild_command);
         s_fdRild_command = -1;
     }
     std::string slotPath(const char *instance) { return root_.at(std::string(RADIO_WIRE_PATH_PREFIX) + instance); }
 
     TestRoot root_;
-    int hostFd_ = -1;
+    HostCapture host_;
 };
 
 }  // namespace
@@ -130,7 +108,7 @@ TEST_F(HalBridge, CommandGoesToTheSelectedSlotWithItsNulAndAnswersComeBackThroug
     EXPECT_EQ(-1, frames[1].serial);
     EXPECT_EQ(std::string("AT+CSQ\0", 7), frames[1].payload);
     EXPECT_EQ(0, slot1.connections());
-    EXPECT_EQ("", drain(hostFd_, 50));  // nothing for the host yet
+    EXPECT_EQ("", host_.drain(50));  // nothing for the host yet
 
     // Answer and unsolicited output reach the main-loop end byte for byte, in order.
     ASSERT_TRUE(slot2.respond("\r\n+CSQ: 20,99\r\n\r\nOK\r\n"));
@@ -138,7 +116,7 @@ TEST_F(HalBridge, CommandGoesToTheSelectedSlotWithItsNulAndAnswersComeBackThroug
     std::string expected = std::string("\r\n+CSQ: 20,99\r\n\r\nOK\r\n") + std::string("\r\n+CREG: 1\r\n\0", 13);
     std::string got;
     ASSERT_TRUE(eventually([&] {
-        got += drain(s_fdRild_command, 20);
+        got += drainFd(s_fdRild_command, 20);
         return got.size() >= expected.size();
     }));
     EXPECT_EQ(expected, got);
@@ -154,7 +132,7 @@ TEST_F(HalBridge, MissingServiceOrSlotAnswersNoModemAndStillMarksTheCommand) {
     // No service at all.
     EXPECT_EQ(0, sendDataToRild("AT+CSQ"));
     EXPECT_TRUE(isATCmdInject);
-    EXPECT_EQ("\r\nERROR:No Modem\r\n", drain(hostFd_));
+    EXPECT_EQ("\r\nERROR:No Modem\r\n", host_.drain());
 
     // An unsupported selection refuses without touching any service.
     FakeRadioService slot1(slotPath("slot1"));
@@ -164,7 +142,7 @@ TEST_F(HalBridge, MissingServiceOrSlotAnswersNoModemAndStillMarksTheCommand) {
     EXPECT_FALSE(sendRequest("AT", 3));
     EXPECT_EQ(0, sendDataToRild("AT"));
     EXPECT_TRUE(isATCmdInject);
-    EXPECT_EQ("\r\nERROR:No Modem\r\n", drain(hostFd_));
+    EXPECT_EQ("\r\nERROR:No Modem\r\n", host_.drain());
     EXPECT_EQ(0, slot1.connections());
 
     // Back to slot 0: the service that appeared meanwhile is found.
@@ -217,7 +195,7 @@ TEST_F(HalBridge, ServiceDeathDropsEveryProxyAndTheNextCommandRegistersAgain) {
     EXPECT_EQ(RADIO_WIRE_REQUEST, frames[3].type);
     // Answers on the new connection reach the pair.
     ASSERT_TRUE(slot3.respond("OK"));
-    EXPECT_EQ("OK", drain(s_fdRild_command));
+    EXPECT_EQ("OK", drainFd(s_fdRild_command));
 }
 
 TEST_F(HalBridge, NewModemPairReplacesAndClosesTheOldBridgeEnd) {
@@ -237,14 +215,14 @@ TEST_F(HalBridge, NewModemPairReplacesAndClosesTheOldBridgeEnd) {
     close(oldMainEnd);
 
     ASSERT_TRUE(slot1.respond("\r\nRING\r\n"));
-    EXPECT_EQ("\r\nRING\r\n", drain(s_fdRild_command));
+    EXPECT_EQ("\r\nRING\r\n", drainFd(s_fdRild_command));
 
     // With a valid link nothing new is made.
     int current = s_fdRild_command;
     connectTarget(RIL_TYPE);
     EXPECT_EQ(current, s_fdRild_command);
     ASSERT_TRUE(slot1.respond("OK"));
-    EXPECT_EQ("OK", drain(s_fdRild_command));
+    EXPECT_EQ("OK", drainFd(s_fdRild_command));
 }
 
 TEST_F(HalBridge, LineWithSubOrEscEndsSmsTextInput) {

@@ -33,13 +33,7 @@ protected:
     void serviceAnswers(const std::string &answer) {
         ASSERT_EQ(static_cast<ssize_t>(answer.size()), write(service_[1], answer.data(), answer.size()));
     }
-    std::string serviceReceived() {
-        std::string out;
-        char buf[256];
-        ssize_t n;
-        while ((n = read(service_[1], buf, sizeof(buf))) > 0) out.append(buf, static_cast<size_t>(n));
-        return out;
-    }
+    std::string serviceReceived() { return readAvailable(service_[1]); }
     void serviceGone() {
         close(service_[1]);
         service_[1] = -1;

@@ -16,28 +16,13 @@
 
 #include "core/reader.h"
 #include "dispatch/dispatcher.h"
+#include "host_capture.h"
 #include "serial/response_writer.h"
 #include "serial/serial_device.h"
 #include "targets/mmi_queue.h"
 #include "targets/target_conn.h"
 #include "targets/target_relay.h"
 #include "test_root.h"
-
-// Everything fd delivers until it stays quiet for a moment.
-inline std::string drainFd(int fd, int firstWaitMs = 300) {
-    std::string out;
-    char buf[16384];
-    int wait = firstWaitMs;
-    for (;;) {
-        pollfd p{fd, POLLIN, 0};
-        if (poll(&p, 1, wait) <= 0) break;
-        ssize_t n = recv(fd, buf, sizeof(buf), MSG_DONTWAIT);
-        if (n <= 0) break;
-        out.append(buf, static_cast<size_t>(n));
-        wait = 50;
-    }
-    return out;
-}
 
 inline void closeIfOpen(int &fd) {
     if (fd >= 0) close(fd);
@@ -47,20 +32,13 @@ inline void closeIfOpen(int &fd) {
 class TargetLinks : public ::testing::Test {
 protected:
     void SetUp() override {
-        int host[2];
-        ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM, 0, host));
-        gSerialDevice.fd[DEVICE_SERIAL] = host[0];
-        gSerialDevice.currDevice = DEVICE_SERIAL;
-        host_ = host[1];
-        gNumericMode = false;
+        ASSERT_TRUE(host_.ok());
         isATCmdInject = false;
         isMsgCmdInput = false;
         mmiCmdSeqReset();
         s_fdRild_command = s_fdService_command = s_fdAudio_command = s_fdAudioExt_command = -1;
     }
     void TearDown() override {
-        closeIfOpen(gSerialDevice.fd[DEVICE_SERIAL]);
-        closeIfOpen(host_);
         closeIfOpen(s_fdRild_command);
         closeIfOpen(s_fdService_command);
         closeIfOpen(s_fdAudio_command);
@@ -93,10 +71,10 @@ protected:
     void sendAll(int fd, const std::string &data) {
         ASSERT_EQ(static_cast<ssize_t>(data.size()), send(fd, data.data(), data.size(), MSG_NOSIGNAL));
     }
-    std::string hostOutput(int waitMs = 300) { return drainFd(host_, waitMs); }
+    std::string hostOutput(int waitMs = 300) { return host_.drain(waitMs); }
 
     TestRoot root_;
-    int host_ = -1;
+    HostCapture host_;
     std::vector<int> extra_;
 };
 
