@@ -22,28 +22,12 @@
 
 #include <gtest/gtest.h>
 
+#include "sim_text.h"
+#include "sim_util.h"
+
 namespace {
 
-long long monoMs() {
-    struct timespec ts;
-    clock_gettime(CLOCK_MONOTONIC, &ts);
-    return static_cast<long long>(ts.tv_sec) * 1000 + ts.tv_nsec / 1000000;
-}
-
-void sleepMs(int ms) {
-    struct timespec ts = {ms / 1000, (ms % 1000) * 1000000L};
-    while (nanosleep(&ts, &ts) != 0 && errno == EINTR) {
-    }
-}
-
 int removeEntry(const char *path, const struct stat *, int, struct FTW *) { return remove(path); }
-
-void mkdirs(const std::string &path) {
-    for (size_t pos = path.find('/', 1); ; pos = path.find('/', pos + 1)) {
-        mkdir(path.substr(0, pos).c_str(), 0755);
-        if (pos == std::string::npos) break;
-    }
-}
 
 }  // namespace
 
@@ -172,7 +156,7 @@ std::string SimDevice::readFile(const std::string &devicePath) const {
 
 void SimDevice::writeFile(const std::string &devicePath, const std::string &content) const {
     std::string path = root_ + devicePath;
-    mkdirs(path.substr(0, path.rfind('/')));
+    sim::makeDirs(path.substr(0, path.rfind('/')));
     std::ofstream out(path, std::ios::binary | std::ios::trunc);
     out << content;
 }
@@ -210,15 +194,15 @@ std::string SimDevice::env(const std::string &key) const {
 pid_t SimDevice::tolkdPid() const { return static_cast<pid_t>(atol(env("TOLKD_PID").c_str())); }
 
 int SimDevice::tolkdExitStatus(int timeoutMs) const {
-    long long deadline = monoMs() + timeoutMs;
+    long long deadline = sim::nowMs() + timeoutMs;
     for (;;) {
         std::string s = readFile("/run/tolkd.status");
         if (!s.empty()) {
             if (s.compare(0, 7, "signal ") == 0) return 128 + atoi(s.c_str() + 7);
             return atoi(s.c_str());
         }
-        if (monoMs() >= deadline) return -1;
-        sleepMs(10);
+        if (sim::nowMs() >= deadline) return -1;
+        sim::sleepMs(10);
     }
 }
 
@@ -235,7 +219,7 @@ int SimDevice::tolkdFdCount() const {
 }
 
 int SimDevice::openSerial() const {
-    int fd = open((root_ + "/host/ttyACM0").c_str(), O_RDWR | O_NOCTTY | O_CLOEXEC);
+    int fd = open(sim::RootLayout{root_}.hostTty().c_str(), O_RDWR | O_NOCTTY | O_CLOEXEC);
     if (fd < 0) return -1;
     struct termios t;
     if (tcgetattr(fd, &t) == 0) {
@@ -246,21 +230,7 @@ int SimDevice::openSerial() const {
     return fd;
 }
 
-int SimDevice::connectAdb() const {
-    std::string path = root_ + "/dev/socket/adb_tolk_socket";
-    struct sockaddr_un addr;
-    memset(&addr, 0, sizeof addr);
-    addr.sun_family = AF_UNIX;
-    if (path.size() >= sizeof addr.sun_path) return -1;
-    memcpy(addr.sun_path, path.c_str(), path.size());
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    if (fd < 0) return -1;
-    if (connect(fd, reinterpret_cast<struct sockaddr *>(&addr), sizeof addr) != 0) {
-        close(fd);
-        return -1;
-    }
-    return fd;
-}
+int SimDevice::connectAdb() const { return sim::connectUnix(sim::RootLayout{root_}.adbSocket()); }
 
 bool writeAll(int fd, const std::string &data) {
     size_t done = 0;
@@ -285,10 +255,10 @@ namespace {
 template <typename Stop>
 std::string readLoop(int fd, int quietMs, int totalMs, Stop stop) {
     std::string got;
-    long long deadline = monoMs() + totalMs;
+    long long deadline = sim::nowMs() + totalMs;
     char buf[8192];
     for (;;) {
-        long long left = deadline - monoMs();
+        long long left = deadline - sim::nowMs();
         if (left <= 0) break;
         int wait = quietMs >= 0 && quietMs < left ? quietMs : static_cast<int>(left);
         struct pollfd p = {fd, POLLIN, 0};
@@ -318,30 +288,13 @@ std::string readUntil(int fd, const std::string &needle, int timeoutMs) {
                     [&](const std::string &got) { return got.find(needle) != std::string::npos; });
 }
 
-std::string visible(const std::string &bytes) {
-    std::string out;
-    char tmp[8];
-    for (unsigned char c : bytes) {
-        if (c == '\r')
-            out += "\\r";
-        else if (c == '\n')
-            out += "\\n";
-        else if (c == '\\')
-            out += "\\\\";
-        else if (c < 0x20 || c >= 0x7f) {
-            snprintf(tmp, sizeof tmp, "\\x%02x", c);
-            out += tmp;
-        } else
-            out.push_back(static_cast<char>(c));
-    }
-    return out;
-}
+std::string visible(const std::string &bytes) { return sim::visibleBytes(bytes); }
 
 bool SimDevice::waitForLog(const std::string &needle, int timeoutMs) const {
-    long long deadline = monoMs() + timeoutMs;
+    long long deadline = sim::nowMs() + timeoutMs;
     for (;;) {
         if (log().find(needle) != std::string::npos) return true;
-        if (monoMs() >= deadline) return false;
-        sleepMs(10);
+        if (sim::nowMs() >= deadline) return false;
+        sim::sleepMs(10);
     }
 }
