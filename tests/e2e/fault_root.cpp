@@ -1,0 +1,161 @@
+// The device around the daemon in a bad state: properties at their limits or
+// holding nonsense where a number is read, and the device root's files missing,
+// unreadable or of the wrong shape. Every command still gets a defined answer.
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <gtest/gtest.h>
+
+#include "fault_checks.h"
+#include "modem_e2e.h"
+
+using namespace fault_checks;
+using namespace modem_e2e;
+
+namespace {
+
+const std::string kNoModem = "\r\nERROR:No Modem\r\n";
+
+TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
+    SimDevice d(openModem());
+    ASSERT_TRUE(d.started()) << d.upOutput();
+    const std::string v91(91, '7');
+
+    // The SIM choice names a slot; anything else finds no modem, never a wrong slot.
+    struct SlotCase {
+        const char *sim, *cdma;
+        std::string answer;
+    } slots[] = {
+        {"abc", "1", "\r\n350000000000001\r\n\r\nOK\r\n"},  // no number reads as 0: slot 1
+        {"3", "1", "\r\n350000000000004\r\n\r\nOK\r\n"},
+        {"4", "1", kNoModem},
+        {"-1", "1", kNoModem},
+        {"9", "2", "\r\n350000000000002\r\n\r\nOK\r\n"},
+        {"9", "xyz", kNoModem},
+        {"9", "0", kNoModem},
+        {"9", "5", kNoModem},
+        {"9", "-2147483648", kNoModem},  // one below would overflow
+        {"9", "2147483647", kNoModem},
+    };
+    // Twice: each slot's service link, once made, is kept; the second pass must
+    // not add any.
+    int fds = -1;
+    for (int pass = 0; pass < 2; pass++) {
+        for (const SlotCase &c : slots) {
+            SCOPED_TRACE(std::string("sim ") + c.sim + " cdma " + c.cdma);
+            d.setprop("persist.service.tolk.sim", c.sim);
+            d.setprop("persist.radio.cdma_slot", c.cdma);
+            EXPECT_EQ(visible(c.answer), visible(d.at("AT+CGSN", true)));
+        }
+        if (pass == 0) fds = baselineFds(d);
+    }
+    d.setprop("persist.service.tolk.sim", v91);
+    EXPECT_EQ(visible(kNoModem), visible(d.at("AT+CGSN", true)));
+    d.setprop("persist.service.tolk.sim", "0");
+
+    // A switch holding a 91-character value or text is reported, not misread.
+    d.setprop("persist.service.tolk_urc.enable", v91);
+    EXPECT_EQ("\r\n+EURC:invalid value.\r\n\r\nOK\r\n", d.at("AT%EURC?", true));
+    d.setprop("persist.service.tolk_urc.enable", "abc");
+    EXPECT_EQ("\r\n+EURC:0\r\n\r\nOK\r\n", d.at("AT%EURC?", true));
+    // The longest USB configuration is echoed whole.
+    d.setprop("sys.usb.config", std::string(91, 'm'));
+    EXPECT_EQ("\r\n@USBCONFIG: \"" + std::string(91, 'm') + "\"\r\n\r\nOK\r\n\r\nOK\r\n", d.at("AT@USBCONFIG?", true));
+    expectServing(d, fds, "after the property cases");
+}
+
+TEST(FaultRoot, BootModeFileOfAnyShape) {
+    struct Case {
+        std::vector<std::string> args;
+        bool serves;
+    } cases[] = {
+        {{"--no-boot-mode"}, true},
+        {{"--boot-mode", ""}, true},
+        {{"--boot-mode", "x5"}, true},
+        {{"--boot-mode", "\xff\xfe"}, true},
+        {{"--boot-mode", "57"}, false},  // only the first character counts
+    };
+    for (const Case &c : cases) {
+        SCOPED_TRACE(visible(c.args.back()));
+        SimDevice d(c.args);
+        if (c.serves) {
+            ASSERT_TRUE(d.started()) << d.upOutput();
+            EXPECT_EQ(visible(kCsdfAnswer), visible(d.at("AT+CSDF?", true)));
+        } else {
+            EXPECT_FALSE(d.started());
+            EXPECT_EQ(0, d.tolkdExitStatus(3000));
+        }
+    }
+}
+
+TEST(FaultRoot, StoresAndDeviceFilesMissingOrMisshaped) {
+    SimDevice d;
+    ASSERT_TRUE(d.started()) << d.upOutput();
+    int fds = baselineFds(d);
+    const std::string root = d.root();
+    const std::string store = root + "/nvram/PRODUCT_INFO";
+
+    // The product-information store: missing, too short, a folder. Reads give the
+    // documented fallbacks, writes are answered as before (their failure is logged).
+    struct StoreCase {
+        const char *what;
+        std::string userAt;
+    } stores[] = {{"missing", "\r\nUserAT =0\r\nOK\r\n"},
+                  {"short", "\r\nUserAT =\r\nOK\r\n"},
+                  {"folder", "\r\nUserAT =0\r\nOK\r\n"}};
+    for (const StoreCase &c : stores) {
+        SCOPED_TRACE(c.what);
+        unlink(store.c_str());
+        rmdir(store.c_str());
+        if (std::string(c.what) == "short") d.writeFile("/nvram/PRODUCT_INFO", std::string(10, '\0'));
+        if (std::string(c.what) == "folder") mkdir(store.c_str(), 0755);
+        EXPECT_EQ(visible(c.userAt), visible(d.at("AT*CIT_ReadUserAT", true)));
+        EXPECT_EQ("\r\nWriteUserAT Pass\r\nOK\r\n", d.at("AT*CIT_WriteUserAT", true));
+        EXPECT_EQ(visible(c.userAt), visible(d.at("AT*CIT_ReadUserAT", true))) << "nothing was written";
+    }
+    rmdir(store.c_str());
+    d.writeFile("/nvram/PRODUCT_INFO", std::string(1024, '\0'));
+    EXPECT_EQ("\r\nWriteUserAT Pass\r\nOK\r\n", d.at("AT*CIT_WriteUserAT", true));
+    EXPECT_EQ("\r\nUserAT =0\r\nOK\r\n", d.at("AT*CIT_ReadUserAT", true));
+
+    // The CIT result file: a folder, too long, too short, unreadable.
+    const std::string citf = root + "/data/prod/citf";
+    mkdir((root + "/data").c_str(), 0755);
+    mkdir((root + "/data/prod").c_str(), 0755);
+    unlink(citf.c_str());
+    mkdir(citf.c_str(), 0755);
+    EXPECT_EQ("\r\nOK\r\n", d.at("AT*CIT_GACITF", true));
+    EXPECT_EQ("\r\nERROR\r\n", d.at("AT*CIT_WCITF", true)) << "a result that cannot be stored is no success";
+    rmdir(citf.c_str());
+    d.writeFile("/data/prod/citf", std::string(100, 'Z'));
+    EXPECT_EQ("\r\n" + std::string(32, 'Z') + "\r\nOK\r\n", d.at("AT*CIT_GACITF", true));
+    d.writeFile("/data/prod/citf", "ab");
+    EXPECT_EQ("\r\nOK\r\n", d.at("AT*CIT_WCITF", true));
+    EXPECT_EQ("x0000001", d.readFile("/data/prod/citf")) << "a short file is written whole";
+
+    // The PMIC ADC device: missing, junk, extreme values, a folder.
+    struct AdcCase {
+        const char *what, *content;
+        std::string gcsf, gbv;
+    } adcs[] = {
+        {"missing", nullptr, "\r\n1\r\nOK\r\n", "\r\nERROR\r\n"},
+        {"junk", "hello\n\x01\x02 zz\n", "\r\n1\r\nOK\r\n", "\r\nERROR\r\n"},
+        {"lowest", "1 -2147483648 0\n66 5 0\n", "\r\n0\r\nOK\r\n", "\r\n-429496729\r\nOK\r\n"},
+        {"highest", "1 2147483647 0\n", "\r\n1\r\nOK\r\n", "\r\n429496729\r\nOK\r\n"},
+        {"folder", "", "\r\n1\r\nOK\r\n", "\r\nERROR\r\n"},
+    };
+    const std::string adc = root + "/dev/OV_pmic_adc_cali";
+    for (const AdcCase &c : adcs) {
+        SCOPED_TRACE(c.what);
+        unlink(adc.c_str());
+        rmdir(adc.c_str());
+        if (c.content && *c.content) d.writeFile("/dev/OV_pmic_adc_cali", c.content);
+        if (c.content && !*c.content) mkdir(adc.c_str(), 0755);
+        EXPECT_EQ(visible(c.gcsf), visible(d.at("AT@GCSF", true)));
+        EXPECT_EQ(visible(c.gbv), visible(d.at("AT@GBV", true)));
+    }
+    rmdir(adc.c_str());
+    expectServing(d, fds, "after the file cases");
+}
+
+}  // namespace
