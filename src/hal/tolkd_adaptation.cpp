@@ -51,7 +51,12 @@ int TolkdAdaptation::getSlotId() {
     if (slotId == 9) {
         char cdmaSlot[PROPERTY_VALUE_MAX] = {0};
         property_get("persist.radio.cdma_slot", cdmaSlot, "1");
-        return atoi(cdmaSlot) - 1;
+        // Any text can sit in the property: only a slot number 1..N names a slot
+        // (atoi of "-2147483648" minus one would overflow).
+        int cdma = atoi(cdmaSlot);
+        if (cdma >= 1 && cdma <= TOLKD_SIM_SLOT_COUNT) return cdma - 1;
+        LOGE("unsupported cdma slot number.");
+        return -1;
     }
     LOGE("unsupported slot number.");
     return -1;
