@@ -11,6 +11,7 @@
 
 #include <vendor/orvane/hardware/radio/2.0/IRadio.h>
 
+#include "eventually.h"
 #include "hidl_fake_radio_service.h"
 #include "test_root.h"
 
@@ -97,15 +98,6 @@ struct Death : hidl_death_recipient {
     Recorder *rec;
     wp<IBase> who;
 };
-
-bool eventually(const std::function<bool()> &cond, int ms = 3000) {
-    auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(ms);
-    while (std::chrono::steady_clock::now() < end) {
-        if (cond()) return true;
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
-    return cond();
-}
 
 }  // namespace
 

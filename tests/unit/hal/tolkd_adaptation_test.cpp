@@ -22,18 +22,10 @@
 #include "serial/serial_device.h"
 #include "targets/target_conn.h"
 #include "targets/target_relay.h"
+#include "eventually.h"
 #include "test_root.h"
 
 namespace {
-
-bool eventually(const std::function<bool()> &cond, int ms = 3000) {
-    auto end = std::chrono::steady_clock::now() + std::chrono::milliseconds(ms);
-    while (std::chrono::steady_clock::now() < end) {
-        if (cond()) return true;
-        std::this_thread::sleep_for(std::chrono::milliseconds(5));
-    }
-    return cond();
-}
 
 bool slotEmpty(int slot) {
     pthread_mutex_lock(&gTolkdAdaptation->mMutex);
