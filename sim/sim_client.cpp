@@ -54,19 +54,14 @@ int openLink(const std::string &root, bool adb, std::string *err) {
         return fd;
     }
     std::string path = L.hostTty();
-    int fd = open(path.c_str(), O_RDWR | O_NOCTTY | O_NONBLOCK | O_CLOEXEC);
+    // Stale output of earlier commands (or unsolicited lines) is not part of
+    // this exchange: flushed at the open, and what the relay still had under way
+    // is read away.
+    int fd = openRawTty(path, O_NONBLOCK);
     if (fd < 0) {
         *err = "cannot open " + path + ": " + strerror(errno);
         return -1;
     }
-    struct termios t;
-    if (tcgetattr(fd, &t) == 0) {
-        cfmakeraw(&t);
-        tcsetattr(fd, TCSANOW, &t);
-    }
-    // Stale output of earlier commands (or unsolicited lines) is not part of
-    // this exchange.
-    tcflush(fd, TCIFLUSH);
     char junk[4096];
     while (read(fd, junk, sizeof junk) > 0) {
     }

@@ -7,6 +7,7 @@
 #include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/un.h>
+#include <termios.h>
 #include <time.h>
 #include <unistd.h>
 
@@ -175,6 +176,18 @@ bool sendAll(int fd, const void *data, size_t len) {
         len -= static_cast<size_t>(n);
     }
     return true;
+}
+
+int openRawTty(const std::string &path, int flags) {
+    int fd = open(path.c_str(), O_RDWR | O_NOCTTY | O_CLOEXEC | flags);
+    if (fd < 0) return -1;
+    struct termios t;
+    if (tcgetattr(fd, &t) == 0) {
+        cfmakeraw(&t);
+        tcsetattr(fd, TCSANOW, &t);
+    }
+    tcflush(fd, TCIFLUSH);
+    return fd;
 }
 
 static volatile sig_atomic_t gStopRequested = 0;

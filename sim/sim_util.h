@@ -63,6 +63,11 @@ int connectUnix(const std::string &path);
 bool sendAll(int fd, const void *data, size_t len);
 inline bool sendAll(int fd, const std::string &bytes) { return sendAll(fd, bytes.data(), bytes.size()); }
 
+// Opens the host end of the serial link (or any tty) as a host program does: raw,
+// with what arrived before the open flushed. flags are added to O_RDWR |
+// O_NOCTTY | O_CLOEXEC. The descriptor, or -1 with errno.
+int openRawTty(const std::string &path, int flags = 0);
+
 // A peer runs until SIGTERM or SIGINT: after watchStopSignals(), stopRequested()
 // turns true at either. SIGPIPE is ignored, so a client that went away shows as a
 // failed write rather than ending the peer.

@@ -218,17 +218,7 @@ int SimDevice::tolkdFdCount() const {
     return n;
 }
 
-int SimDevice::openSerial() const {
-    int fd = open(sim::RootLayout{root_}.hostTty().c_str(), O_RDWR | O_NOCTTY | O_CLOEXEC);
-    if (fd < 0) return -1;
-    struct termios t;
-    if (tcgetattr(fd, &t) == 0) {
-        cfmakeraw(&t);
-        tcsetattr(fd, TCSANOW, &t);
-    }
-    tcflush(fd, TCIFLUSH);
-    return fd;
-}
+int SimDevice::openSerial() const { return sim::openRawTty(sim::RootLayout{root_}.hostTty()); }
 
 int SimDevice::connectAdb() const { return sim::connectUnix(sim::RootLayout{root_}.adbSocket()); }
 
