@@ -26,6 +26,8 @@
 #include <string>
 #include <vector>
 
+extern char **environ;
+
 namespace {
 
 constexpr size_t kMaxMessage = 8192;  // longer messages are cut
@@ -43,6 +45,12 @@ struct LogState {
     std::recursive_mutex mutex;
     bool filterParsed = false;
     std::string filterEnv;  // ANDROID_LOG_TAGS as last parsed
+    // The environment as it was when the filter was parsed (see filter_current).
+    char **envArray = nullptr;
+    size_t envCount = 0;
+    const char *envLast = nullptr;
+    const char *tagsEntry = nullptr;  // the "ANDROID_LOG_TAGS=..." entry, if any
+    size_t tagsIndex = 0;
     int defaultLevel = kDefaultLevel;
     std::vector<TagRule> rules;
     int fd = -1;            // the file destination; -1 for stderr
@@ -96,9 +104,45 @@ void parse_filter(LogState &s, const char *env) {
     s.filterParsed = true;
 }
 
+constexpr char kTagsPrefix[] = "ANDROID_LOG_TAGS=";
+constexpr size_t kTagsPrefixLen = sizeof(kTagsPrefix) - 1;
+
+// Whether the parsed filter still matches ANDROID_LOG_TAGS. The daemon calls the
+// logger dozens of times per command, nearly all of them filtered out, and a
+// getenv() per call (a string compare per environment variable) was most of what
+// a filtered call cost. So the filter is re-read only when the environment may
+// have changed. setenv, unsetenv and putenv keep or move the environ array; within
+// one array, adding a variable fills the slot after the last one, removing one
+// moves the last entry down, and replacing ours changes its pointer; an edit of our
+// entry's text in place is caught by comparing the text.
+bool filter_current(const LogState &s) {
+    if (!s.filterParsed || environ == nullptr || environ != s.envArray) return false;
+    if (environ[s.envCount] != nullptr) return false;
+    if (s.envCount > 0 && environ[s.envCount - 1] != s.envLast) return false;
+    if (s.tagsEntry == nullptr) return true;
+    return environ[s.tagsIndex] == s.tagsEntry && strcmp(s.tagsEntry + kTagsPrefixLen, s.filterEnv.c_str()) == 0;
+}
+
+void reread_filter(LogState &s) {
+    s.envArray = environ;
+    s.envCount = 0;
+    s.envLast = nullptr;
+    s.tagsEntry = nullptr;
+    s.tagsIndex = 0;
+    if (environ != nullptr) {
+        for (; environ[s.envCount] != nullptr; s.envCount++) {
+            if (s.tagsEntry == nullptr && strncmp(environ[s.envCount], kTagsPrefix, kTagsPrefixLen) == 0) {
+                s.tagsEntry = environ[s.envCount];
+                s.tagsIndex = s.envCount;
+            }
+        }
+        if (s.envCount > 0) s.envLast = environ[s.envCount - 1];
+    }
+    parse_filter(s, s.tagsEntry != nullptr ? s.tagsEntry + kTagsPrefixLen : nullptr);
+}
+
 int min_level(LogState &s, const char *tag) {
-    const char *env = getenv("ANDROID_LOG_TAGS");
-    if (!s.filterParsed || s.filterEnv != (env != nullptr ? env : "")) parse_filter(s, env);
+    if (!filter_current(s)) reread_filter(s);
     // The last rule for a tag wins, as when logcat applies them in order.
     for (auto it = s.rules.rbegin(); it != s.rules.rend(); ++it)
         if (it->tag == tag) return it->level;
@@ -169,6 +213,60 @@ pid_t cached_tid() {
     return tTid;
 }
 
+// The line header "MM-DD HH:MM:SS.mmm  PID   TID P TAG: ". Formatting it whole with
+// snprintf for every line cost more than the rest of the line; the parts that
+// change at most once a second (the date and time) or never (the ids) are kept
+// per thread and only the milliseconds, the priority and the tag are put in.
+struct HeadCache {
+    time_t sec = -1;
+    char stamp[32] = "";  // "MM-DD HH:MM:SS"
+    size_t stampLen = 0;
+    pid_t idsPid = 0, idsTid = 0;
+    char ids[32] = "";    // "%5d %5ld"
+    size_t idsLen = 0;
+};
+thread_local HeadCache tHead;
+
+size_t put(char *dst, size_t at, size_t cap, const char *src, size_t n) {
+    if (at >= cap) return at;
+    if (n > cap - at) n = cap - at;
+    memcpy(dst + at, src, n);
+    return at + n;
+}
+
+// Writes the header into out (size bytes, NUL-terminated); its length, at most size - 1.
+int format_head(char *out, size_t size, const struct timespec &ts, char prio, const char *tag) {
+    HeadCache &c = tHead;
+    if (c.sec != ts.tv_sec) {
+        struct tm tm;
+        gmtime_r(&ts.tv_sec, &tm);
+        int n = snprintf(c.stamp, sizeof(c.stamp), "%02d-%02d %02d:%02d:%02d", tm.tm_mon + 1, tm.tm_mday, tm.tm_hour,
+                         tm.tm_min, tm.tm_sec);
+        c.stampLen = n > 0 ? static_cast<size_t>(n) < sizeof(c.stamp) ? static_cast<size_t>(n) : sizeof(c.stamp) - 1 : 0;
+        c.sec = ts.tv_sec;
+    }
+    pid_t pid = cached_pid(), tid = cached_tid();
+    if (c.idsPid != pid || c.idsTid != tid) {
+        int n = snprintf(c.ids, sizeof(c.ids), "%5d %5ld", static_cast<int>(pid), static_cast<long>(tid));
+        c.idsLen = n > 0 ? static_cast<size_t>(n) < sizeof(c.ids) ? static_cast<size_t>(n) : sizeof(c.ids) - 1 : 0;
+        c.idsPid = pid;
+        c.idsTid = tid;
+    }
+    long ms = ts.tv_nsec / 1000000L;
+    char mid[6] = {'.', static_cast<char>('0' + ms / 100), static_cast<char>('0' + ms / 10 % 10),
+                   static_cast<char>('0' + ms % 10), ' ', 0};
+    char prioPart[4] = {' ', prio, ' ', 0};
+    size_t cap = size - 1;
+    size_t at = put(out, 0, cap, c.stamp, c.stampLen);
+    at = put(out, at, cap, mid, 5);
+    at = put(out, at, cap, c.ids, c.idsLen);
+    at = put(out, at, cap, prioPart, 3);
+    at = put(out, at, cap, tag, strlen(tag));
+    at = put(out, at, cap, ": ", 2);
+    out[at] = '\0';
+    return static_cast<int>(at);
+}
+
 void write_all(int fd, const char *p, size_t len) {
     while (len > 0) {
         ssize_t n = write(fd, p, len);
@@ -208,14 +306,8 @@ extern "C" int __android_log_print(int prio, const char *tag, const char *fmt, .
     // Host clock, read directly: time() and gettimeofday() are the simulated clock.
     struct timespec ts;
     clock_gettime(CLOCK_REALTIME, &ts);
-    struct tm tm;
-    gmtime_r(&ts.tv_sec, &tm);
     char head[128];
-    int hlen = snprintf(head, sizeof(head), "%02d-%02d %02d:%02d:%02d.%03ld %5d %5ld %c %s: ", tm.tm_mon + 1,
-                        tm.tm_mday, tm.tm_hour, tm.tm_min, tm.tm_sec, ts.tv_nsec / 1000000L,
-                        static_cast<int>(cached_pid()), static_cast<long>(cached_tid()), prio_char(prio), tag);
-    if (hlen < 0) hlen = 0;
-    if (static_cast<size_t>(hlen) >= sizeof(head)) hlen = sizeof(head) - 1;
+    int hlen = format_head(head, sizeof(head), ts, prio_char(prio), tag);
 
     // Like logcat, every line of a multi-line message gets its own header.
     static thread_local char out[kMaxOutput];
