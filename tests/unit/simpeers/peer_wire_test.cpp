@@ -37,13 +37,6 @@ bool waitFor(const std::string &path, int ms = 3000) {
     return false;
 }
 
-std::string slurp(const std::string &path) {
-    std::ifstream in(path);
-    std::stringstream ss;
-    ss << in.rdbuf();
-    return ss.str();
-}
-
 void spit(const std::string &path, const std::string &text) {
     size_t slash = path.rfind('/');
     makeDirs(path.substr(0, slash));
@@ -139,9 +132,9 @@ TEST(RadioPeer, AnswersOnlyAfterRegisterAndJournalsEveryRequest) {
     sendFrame(fd, RADIO_WIRE_REQUEST, request("hi\x1a"));
     ASSERT_TRUE(recvFrame(fd, &f));
     EXPECT_EQ(f.payload, "\r\n+CMGS: 1\r\n\r\nOK\r\n");
-    EXPECT_EQ(slurp(peer.root() + "/journal/radio.slot2.log"),
+    EXPECT_EQ(sim::readFileOr(peer.root() + "/journal/radio.slot2.log"),
               "AT+CGSN\\x00\nAT+CGSN\\x00\nAT+CMGS=\"1\"\\x00\nhi\\x1a\\x00\n");
-    EXPECT_EQ(slurp(peer.root() + "/journal/radio.slot1.log"), "");
+    EXPECT_EQ(sim::readFileOr(peer.root() + "/journal/radio.slot1.log"), "");
 
     // The daemon reconnects after it saw the service die: a new connection is
     // served the same way, and the slot's modem has forgotten nothing but an
@@ -278,7 +271,7 @@ TEST(GenericPeer, AnswersHoldsAndRecordsMessages) {
     EXPECT_EQ(hear(1000), "\r\n+POWERKEY: 1\r\n\r\nOK\r\n");
     struct stat st;
     EXPECT_NE(stat((peer.root() + "/sim/generic/release").c_str(), &st), 0);
-    EXPECT_EQ(slurp(peer.root() + "/journal/generic.log"),
+    EXPECT_EQ(sim::readFileOr(peer.root() + "/journal/generic.log"),
               "AT+FOO\nAT+WITOF=1\nAT+WITOF=2\nAT+CPIN=+ORVTOLKJ\\r\\nOK\\r\\n;\nAT+POWERKEY\nAT+OTHER\n");
     // (close) ends the link, and the next connection is served.
     say("AT+BYE");
