@@ -7,6 +7,11 @@
 // three host slots) but does nothing else: no pause, no logging, no parsing.
 //
 // With --pause-ms N it sleeps N ms after every serial read, as tolkd must.
+//
+// Two adb lines show what parts of tolkd's answer pattern cost by themselves:
+// "AT+SPLIT" is answered by two writes, a body and then the final result, as
+// tolkd answers a local command; "AT+SPLITLOG" also appends two log lines to a
+// file first, as tolkd logs two info lines before it answers.
 #include <errno.h>
 #include <fcntl.h>
 #include <limits.h>
@@ -24,6 +29,9 @@
 namespace {
 
 const char kOk[] = "\r\nOK\r\n";
+const char kBody[] = "\r\n+SPLIT: 1,1\n\r\n";
+const char kLogLine[] =
+    "12-06 08:27:19.807  5119  5119 I TOLKD: 140:routeCommandLine(): Command:[AT+SPLITLOG]\n";
 
 bool writeAll(int fd, const char *p, size_t n) {
     while (n > 0) {
@@ -78,6 +86,11 @@ int main(int argc, char **argv) {
     }
     int conn = -1;
     char buf[4096];
+    char line[4096];
+    size_t lineLen = 0;
+    char logPath[PATH_MAX];
+    snprintf(logPath, sizeof logPath, "%s/log/ref.log", root);
+    int logFd = open(logPath, O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
 
     for (;;) {
         fd_set rs;
@@ -111,6 +124,7 @@ int main(int argc, char **argv) {
             if (fd >= 0) {
                 if (conn >= 0) close(conn);
                 conn = fd;
+                lineLen = 0;
             }
         }
         if (conn >= 0 && FD_ISSET(conn, &rs)) {
@@ -121,8 +135,20 @@ int main(int argc, char **argv) {
                 conn = -1;
                 continue;
             }
-            for (ssize_t i = 0; i < n; i++)
-                if (buf[i] == '\r') writeAll(conn, kOk, sizeof kOk - 1);
+            for (ssize_t i = 0; i < n; i++) {
+                if (buf[i] != '\r') {
+                    if (lineLen < sizeof line) line[lineLen++] = buf[i];
+                    continue;
+                }
+                bool split = lineLen >= 8 && memcmp(line, "AT+SPLIT", 8) == 0;
+                if (split && lineLen >= 11 && memcmp(line + 8, "LOG", 3) == 0 && logFd >= 0) {
+                    writeAll(logFd, kLogLine, sizeof kLogLine - 1);
+                    writeAll(logFd, kLogLine, sizeof kLogLine - 1);
+                }
+                if (split) writeAll(conn, kBody, sizeof kBody - 1);
+                writeAll(conn, kOk, sizeof kOk - 1);
+                lineLen = 0;
+            }
         }
     }
 }

@@ -562,6 +562,7 @@ Probe lineProbe(int fd, const std::string &cmd) {
 
 struct Figures {
     Stats refAdb, refSerial, refSerialPaused, hal;
+    Stats refSplit, refSplitLog;  // the floor answering in two writes, and after two log lines
     Stats adbCsdf, adbAte1, adbCsq, serCsdf, serAte1, serCsq;
     double refPairs = 0, halPairs = 0, localPairs = 0, modemPairs = 0;
 };
@@ -582,13 +583,15 @@ Figures measureRoundTrips() {
 
     int refAdb = ref.connectAdb(), adb = dev.connectAdb();
     auto a = interleave({lineProbe(refAdb, "AT+CSDF?"), lineProbe(adb, "AT+CSDF?"), lineProbe(adb, "ATE1"), halProbe,
-                         lineProbe(adb, "AT+CSQ")},
+                         lineProbe(adb, "AT+CSQ"), lineProbe(refAdb, "AT+SPLIT"), lineProbe(refAdb, "AT+SPLITLOG")},
                         gCfg.adbSamples);
     f.refAdb = stats(a[0]);
     f.adbCsdf = stats(a[1]);
     f.adbAte1 = stats(a[2]);
     f.hal = stats(a[3]);
     f.adbCsq = stats(a[4]);
+    f.refSplit = stats(a[5]);
+    f.refSplitLog = stats(a[6]);
 
     progress("throughput: sequential pairs");
     if (refAdb >= 0) f.refPairs = pairsPerSecond(refAdb, "AT+CSDF?", gCfg.throughputPairs);
@@ -920,6 +923,18 @@ int main(int argc, char **argv) {
     addRatioRow("adb AT+CSDF? round trip", f.adbCsdf, f.refAdb, 1.5);
     addRatioRow("adb ATE1 round trip", f.adbAte1, f.refAdb, 1.5);
     addRatioRow("adb AT+CSQ round trip (modem)", f.adbCsq, f.hal, 1.5);
+    // What tolkd's answer pattern costs without tolkd: the floor answering with a
+    // body and a final result in two writes, and after two log lines as well; and
+    // the modem path's two links, each at its floor.
+    if (f.refAdb.n && f.refSplit.n && f.refSplitLog.n) {
+        gRows.push_back({"  floor answering in two writes, median", us(f.refSplit.median), us(f.refAdb.median),
+                         fmt("%.2fx", f.refSplit.median / f.refAdb.median), "", "context"});
+        gRows.push_back({"  ... and logging two lines first, median", us(f.refSplitLog.median), us(f.refAdb.median),
+                         fmt("%.2fx", f.refSplitLog.median / f.refAdb.median), "", "context"});
+    }
+    if (f.refAdb.n && f.hal.n)
+        gRows.push_back({"  adb floor + HAL floor, median", us(f.refAdb.median + f.hal.median), us(f.hal.median),
+                         fmt("%.2fx", (f.refAdb.median + f.hal.median) / f.hal.median), "", "context"});
     auto serialRow = [&](const std::string &what, const Stats &d) {
         if (d.n == 0 || f.refSerial.n == 0) {
             gRows.push_back({what, "failed", "", "", "", "NOT MEASURED"});
