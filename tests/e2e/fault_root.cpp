@@ -45,12 +45,12 @@ TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
             SCOPED_TRACE(std::string("sim ") + c.sim + " cdma " + c.cdma);
             d.setprop("persist.service.tolk.sim", c.sim);
             d.setprop("persist.radio.cdma_slot", c.cdma);
-            EXPECT_EQ(visible(c.answer), visible(d.at("AT+CGSN", true)));
+            EXPECT_EQ(visible(c.answer), visible(d.at("AT+CGSN", true, 3000)));
         }
         if (pass == 0) fds = baselineFds(d);
     }
     d.setprop("persist.service.tolk.sim", v91);
-    EXPECT_EQ(visible(kNoModem), visible(d.at("AT+CGSN", true)));
+    EXPECT_EQ(visible(kNoModem), visible(d.at("AT+CGSN", true, 3000)));
     d.setprop("persist.service.tolk.sim", "0");
 
     // A switch holding a 91-character value or text is reported, not misread.
