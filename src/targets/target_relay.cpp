@@ -191,6 +191,22 @@ int sendDataToGenericService(const char *data) {
     return 0;
 }
 
+// An answer longer than one read leaves its tail on the link, where it would be
+// taken for the answer to the next command, and the one after. Nothing else is
+// ever waiting on an audio link before a command goes out (its answer is read
+// before the main loop goes on), so whatever is there now is stale.
+static void dropStaleAudioBytes(int fd) {
+    char scratch[1024];
+    unsigned long dropped = 0;
+    for (;;) {
+        ssize_t n = recv(fd, scratch, sizeof(scratch), MSG_DONTWAIT);
+        if (n < 0 && errno == EINTR) continue;
+        if (n <= 0) break;
+        dropped += (unsigned long)n;
+    }
+    if (dropped > 0) LOGW("dropped %lu stale bytes from the audio link", dropped);
+}
+
 int sendDataToAudio(const char *data, int len, int target) {
     int *fd = audioLink(target);
     if (fd == NULL) {
@@ -202,6 +218,7 @@ int sendDataToAudio(const char *data, int len, int target) {
         return 0;
     }
     if (data == NULL || len < 0) len = 0;
+    dropStaleAudioBytes(*fd);
     LOGD("sendDataToAudio - the data size of send to audio is: %d", len);
     ssize_t n = send(*fd, data, (size_t)len, MSG_NOSIGNAL);
     if (n < 0 || n < (ssize_t)len) LOGE("lose data when send to audio. errno = %d", errno);

@@ -210,3 +210,19 @@ TEST(FaultPeers, CitApplicationSilentClosingAndKilled) {
 }
 
 }  // namespace
+
+// An audio answer longer than the daemon reads at once: the host gets its head,
+// and the tail must not pass for the answers to the commands after it.
+TEST(FaultPeersAudio, OverlongAnswerDoesNotShiftLaterAnswers) {
+    SimDevice d;
+    ASSERT_TRUE(d.started()) << d.upOutput();
+    d.writeFile("/sim/audio/script", "AUD+TXT => (long 100000) X\nAUD+VOL => (long 7000) V\n");
+    HostLink adb(d, true);
+    std::string head = adb.cmd("AUD+TXT", 500);
+    ASSERT_GT(head.size(), 2u);
+    EXPECT_EQ("\r\nX", head.substr(0, 3));
+    EXPECT_EQ(visible("\r\nOK\r\n"), visible(adb.cmd("AUD+BIN")));
+    EXPECT_EQ("\r\nV", adb.cmd("AUD+VOL", 500).substr(0, 3));
+    EXPECT_EQ(visible("\r\nOK\r\n"), visible(adb.cmd("AUD+BIN")));
+    EXPECT_EQ(visible("\r\nOK\r\n"), visible(adb.cmd("MM+LOOP=1")));
+}
