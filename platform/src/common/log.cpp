@@ -114,7 +114,8 @@ constexpr size_t kTagsPrefixLen = sizeof(kTagsPrefix) - 1;
 // have changed. setenv, unsetenv and putenv keep or move the environ array; within
 // one array, adding a variable fills the slot after the last one, removing one
 // moves the last entry down, and replacing ours changes its pointer; an edit of our
-// entry's text in place is caught by comparing the text.
+// entry's text in place is caught by comparing the text. (Only clearenv() could
+// free the array and let a smaller one take its address; nothing here calls it.)
 bool filter_current(const LogState &s) {
     if (!s.filterParsed || environ == nullptr || environ != s.envArray) return false;
     if (environ[s.envCount] != nullptr) return false;
