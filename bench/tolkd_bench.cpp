@@ -17,6 +17,7 @@
 #include <fcntl.h>
 #include <ftw.h>
 #include <poll.h>
+#include <pthread.h>
 #include <signal.h>
 #include <stdarg.h>
 #include <stdio.h>
@@ -258,31 +259,58 @@ bool isFinal(const std::string &s) { return endsWith(s, "OK\r\n") || endsWith(s,
 // Writes line and reads until the bytes received end in a final result. Returns
 // the nanoseconds from just before the write to the last byte, or -1 on failure or
 // after timeoutMs.
+// A device that stops answering must end the exchange, not the benchmark; but a
+// poll() before every read would add a system call to each sample. So reads block,
+// and a watchdog thread interrupts the exchanging thread with SIGUSR1 (installed
+// without SA_RESTART) once an exchange has run past its deadline.
+std::atomic<long long> gExchangeDeadline{0};
+pthread_t gExchanger;
+
+void onWatchdog(int) {}
+
+void startWatchdog() {
+    struct sigaction sa;
+    memset(&sa, 0, sizeof sa);
+    sa.sa_handler = onWatchdog;
+    sigaction(SIGUSR1, &sa, nullptr);
+    gExchanger = pthread_self();
+    std::thread([] {
+        for (;;) {
+            sleepMs(100);
+            long long d = gExchangeDeadline.load();
+            if (d != 0 && nowNs() > d) pthread_kill(gExchanger, SIGUSR1);
+        }
+    }).detach();
+}
+
+// Writes line and reads until the bytes received end in a final result. Returns
+// the nanoseconds from just before the write to the last byte, or -1 on failure or
+// after timeoutMs.
 long long exchangeLine(int fd, const std::string &line, std::string *got = nullptr, int timeoutMs = 3000) {
     std::string in;
     char buf[4096];
     long long t0 = nowNs();
-    if (write(fd, line.data(), line.size()) != static_cast<ssize_t>(line.size())) return -1;
     long long deadline = t0 + timeoutMs * 1000000LL;
-    for (;;) {
-        ssize_t n = read(fd, buf, sizeof buf);
-        if (n > 0) {
-            in.append(buf, static_cast<size_t>(n));
-            if (isFinal(in)) break;
-            continue;
+    gExchangeDeadline = deadline;
+    long long result = -1;
+    if (write(fd, line.data(), line.size()) == static_cast<ssize_t>(line.size())) {
+        for (;;) {
+            ssize_t n = read(fd, buf, sizeof buf);
+            if (n > 0) {
+                in.append(buf, static_cast<size_t>(n));
+                if (isFinal(in)) {
+                    result = nowNs() - t0;
+                    break;
+                }
+                continue;
+            }
+            if (n < 0 && errno == EINTR && nowNs() < deadline) continue;
+            break;
         }
-        if (n < 0 && errno == EINTR) continue;
-        if (n < 0 && errno == EAGAIN) {
-            struct pollfd p = {fd, POLLIN, 0};
-            long long left = (deadline - nowNs()) / 1000000;
-            if (left <= 0 || poll(&p, 1, static_cast<int>(left)) <= 0) return -1;
-            continue;
-        }
-        return -1;
     }
-    long long t1 = nowNs();
+    gExchangeDeadline = 0;
     if (got) *got = in;
-    return t1 - t0;
+    return result;
 }
 
 void setNonBlocking(int fd) { fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) | O_NONBLOCK); }
@@ -910,6 +938,7 @@ int main(int argc, char **argv) {
         gCfg.startRuns = 3;
     }
     signal(SIGPIPE, SIG_IGN);
+    startWatchdog();
 
     Figures f = measureRoundTrips();
     LogFigures lg = measureLogging();
