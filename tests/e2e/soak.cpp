@@ -96,7 +96,9 @@ TEST(Soak, MixedTrafficOnBothLinks) {
     EXPECT_GT(rssAfterWarmup, 0);
     // Under a wrapper (valgrind) the process's memory is mostly the wrapper's own.
     const char *wrapper = getenv("TOLK_E2E_TOLKD");
-    if (!wrapper || !*wrapper) EXPECT_EQ(rssAfterWarmup, rss) << "resident memory grew";
+    if (!wrapper || !*wrapper) {
+        EXPECT_EQ(rssAfterWarmup, rss) << "resident memory grew";
+    }
     // Each forwarded command reached its peer exactly once.
     std::string radio = radioJournal(d, 1), generic = genericJournal(d);
     long radioLines = countOf(radio, "\n"), genericLines = countOf(generic, "\n");
