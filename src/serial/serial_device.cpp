@@ -105,6 +105,10 @@ int open_serial_device(SerialDevice *dev, const char *path) {
     options.c_lflag = echo == 1 ? (ICANON | ECHO | IEXTEN) : (ICANON | IEXTEN);
     options.c_cc[VEOL] = 0x1A;
     options.c_cc[VEOL2] = 0x1B;
+    // Ctrl-D is data here, not end of file: as end of file it would make a read
+    // return 0 at a line start, which the reader must take for a dead port (close,
+    // reopen, queued input flushed), and would cut a line short anywhere else.
+    options.c_cc[VEOF] = _POSIX_VDISABLE;
 
     (void)tcflush(fd, TCIFLUSH);
     // Never apply a record that was not read from the port: on a terminal an

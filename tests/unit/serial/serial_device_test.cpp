@@ -68,6 +68,25 @@ TEST_F(SerialDeviceTest, OpenOtherPortMasksOutputAndEchoes) {
     EXPECT_EQ(-1, open_serial_device(&gSerialDevice, nullptr));
 }
 
+// Ctrl-D from the host is a byte like any other: were it the terminal's end-of-file
+// character, the read would return 0 at a line start, which the reader takes for a
+// dead port (close, reopen, queued input flushed), and would cut a line short after
+// its last character elsewhere.
+TEST_F(SerialDeviceTest, ControlDIsDataNotEndOfFile) {
+    const int fd = openPort();
+    ASSERT_GE(fd, 0);
+    ASSERT_EQ(4, write(pty_.master, "\x04" "AT\n", 4));
+    char buf[64];
+    struct pollfd p = {fd, POLLIN, 0};
+    ASSERT_EQ(1, poll(&p, 1, 500));
+    EXPECT_EQ(4, read(fd, buf, sizeof(buf))) << "a Ctrl-D at a line start must not read as end of file";
+    ASSERT_EQ(8, write(pty_.master, "AT+CSQ\x04\n", 8));
+    EXPECT_EQ(std::string("AT+CSQ\x04\n"), readFor(fd, 8)) << "nor end a line before its delimiter";
+    // A NUL byte stays ordinary too, with end-of-file switched off.
+    ASSERT_EQ(4, write(pty_.master, "A\0T\n", 4));
+    EXPECT_EQ(std::string("A\0T\n", 4), readFor(fd, 4));
+}
+
 TEST_F(SerialDeviceTest, EchoSwitchKeepsSmsLineEnds) {
     const int fd = openPort();
     ASSERT_GE(fd, 0);
