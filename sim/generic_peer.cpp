@@ -28,10 +28,7 @@ const char kMmiMark[] = "+ORVTOLKJ";
 
 struct Pending {
     int fd;
-    long long due;
-    bool hold;
-    bool close;
-    std::string text;
+    AnswerStep step;
 };
 
 class GenericService {
@@ -79,27 +76,18 @@ void GenericService::receive(int fd) {
         if (msg.find(kMmiMark) != std::string::npos) return;
         sa.frames.push_back("\r\nOK\r\n");
     }
-    long long now = nowMs();
-    if (sa.close) {
-        pending_.push_back(Pending{fd, now + sa.delayMs, sa.hold, true, ""});
-        return;
-    }
-    for (size_t i = 0; i < sa.frames.size(); i++)
-        pending_.push_back(
-            Pending{fd, now + sa.delayMs + static_cast<long long>(i) * sa.gapMs, sa.hold, false, sa.frames[i]});
+    for (AnswerStep &step : answerSteps(sa, nowMs())) pending_.push_back(Pending{fd, std::move(step)});
 }
 
 void GenericService::deliverDue() {
     long long now = nowMs();
-    std::string release = root_ + "/sim/generic/release";
-    bool released = access(release.c_str(), F_OK) == 0;
-    if (released) unlink(release.c_str());
+    bool released = takeReleaseFile(root_ + "/sim/generic/release");
     std::vector<Pending> due, keep;
-    for (Pending &p : pending_) ((p.due > now || (p.hold && !released)) ? keep : due).push_back(p);
+    for (Pending &p : pending_) (p.step.ready(now, released) ? due : keep).push_back(p);
     pending_.swap(keep);
     for (Pending &p : due) {
         if (std::find(clients_.begin(), clients_.end(), p.fd) == clients_.end()) continue;
-        if (p.close || !sendAll(p.fd, p.text.data(), p.text.size())) dropClient(p.fd);
+        if (p.step.close || !sendAll(p.fd, p.step.frame)) dropClient(p.fd);
     }
 }
 
@@ -118,13 +106,7 @@ int GenericService::run() {
         std::vector<struct pollfd> fds;
         fds.push_back({listenFd_, POLLIN, 0});
         for (int c : clients_) fds.push_back({c, POLLIN, 0});
-        int timeout = 100;
-        long long now = nowMs();
-        for (const Pending &p : pending_) {
-            if (p.hold) timeout = std::min(timeout, 20);
-            timeout = static_cast<int>(std::max(0LL, std::min<long long>(timeout, p.due - now)));
-        }
-        int r = poll(fds.data(), fds.size(), timeout);
+        int r = poll(fds.data(), fds.size(), stepPollTimeout(pending_, nowMs()));
         if (r < 0 && errno != EINTR) break;
         if (r > 0) {
             if (fds[0].revents & POLLIN) {

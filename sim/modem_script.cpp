@@ -3,6 +3,7 @@
 #include <errno.h>
 #include <string.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cstdio>
 #include <fstream>
@@ -126,6 +127,25 @@ bool ScriptFile::lookup(const std::string &request, ScriptAnswer *out) {
         }
     }
     return false;
+}
+
+std::vector<AnswerStep> answerSteps(const ScriptAnswer &answer, long long now) {
+    std::vector<AnswerStep> steps;
+    if (answer.close) {
+        steps.push_back(AnswerStep{now + answer.delayMs, answer.hold, true, ""});
+        return steps;
+    }
+    for (size_t i = 0; i < answer.frames.size(); i++) {
+        steps.push_back(AnswerStep{now + answer.delayMs + static_cast<long long>(i) * answer.gapMs, answer.hold,
+                                   false, answer.frames[i]});
+    }
+    return steps;
+}
+
+bool takeReleaseFile(const std::string &path) {
+    if (access(path.c_str(), F_OK) != 0) return false;
+    unlink(path.c_str());
+    return true;
 }
 
 int listenUnix(const std::string &path, int backlog) {

@@ -29,6 +29,37 @@ struct ScriptAnswer {
     bool close = false;               // drop the client connection instead of answering
 };
 
+// One step of an answer laid out in time: a frame to send, or (close) the
+// connection to drop.
+struct AnswerStep {
+    long long due = 0;  // nowMs() time
+    bool hold = false;  // also waits for the release file
+    bool close = false;
+    std::string frame;
+
+    bool ready(long long now, bool released) const { return due <= now && (!hold || released); }
+};
+// The steps of an answer given at time now: a single close step, or one step per
+// frame, the first after delayMs and the next ones gapMs apart.
+std::vector<AnswerStep> answerSteps(const ScriptAnswer &answer, long long now);
+// How long a service's poll may sleep while these steps wait (each element of
+// pending has its AnswerStep as .step): never past a due step, and at most 20 ms
+// while one is held, so that the release file is seen soon.
+template <typename Pending>
+int stepPollTimeout(const std::vector<Pending> &pending, long long now, int idleMs = 100) {
+    int timeout = idleMs;
+    for (const Pending &p : pending) {
+        if (p.step.hold && timeout > 20) timeout = 20;
+        long long left = p.step.due - now;
+        if (left < 0) left = 0;
+        if (left < timeout) timeout = static_cast<int>(left);
+    }
+    return timeout;
+}
+// True once when the release file exists: it is taken away, so each file
+// releases what is held at that moment.
+bool takeReleaseFile(const std::string &path);
+
 struct ScriptRule {
     std::string key;     // unescaped, compared without case
     bool prefix = false; // key ended in '*'

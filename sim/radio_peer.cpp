@@ -60,12 +60,8 @@ struct Slot {
 struct Pending {
     int slot;
     unsigned client;
-    long long due;
-    bool hold;
-    bool close;
-    uint32_t type;
     int32_t serial;
-    std::string payload;
+    AnswerStep step;
 };
 
 class RadioService {
@@ -87,7 +83,6 @@ private:
     void openTty();
     void serveControl();
     void deliverDue();
-    int pollTimeout() const;
 
     std::string root_;
     std::string modemTtyPath_;
@@ -142,15 +137,8 @@ void RadioService::answer(Slot &s, unsigned id, int32_t serial, const std::strin
         if (!s.modem->handle(request, &text)) return;
         sa.frames.push_back(text);
     }
-    long long now = nowMs();
-    if (sa.close) {
-        pending_.push_back(Pending{s.number, id, now + sa.delayMs, sa.hold, true, 0, serial, ""});
-        return;
-    }
-    for (size_t i = 0; i < sa.frames.size(); i++) {
-        pending_.push_back(Pending{s.number, id, now + sa.delayMs + static_cast<long long>(i) * sa.gapMs,
-                                   sa.hold, false, RADIO_WIRE_RESPONSE, serial, sa.frames[i]});
-    }
+    for (AnswerStep &step : answerSteps(sa, nowMs()))
+        pending_.push_back(Pending{s.number, id, serial, std::move(step)});
 }
 
 void RadioService::readClient(Slot &s, unsigned id) {
@@ -239,39 +227,25 @@ void RadioService::serveControl() {
 
 void RadioService::deliverDue() {
     long long now = nowMs();
-    std::string release = root_ + "/sim/radio/release";
-    bool released = access(release.c_str(), F_OK) == 0;
-    if (released) unlink(release.c_str());
+    bool released = takeReleaseFile(root_ + "/sim/radio/release");
     std::vector<Pending> keep;
     for (Pending &p : pending_) {
         Slot &s = slots_[p.slot - 1];
         Client *c = findClient(s, p.client);
         if (!c) continue;  // that client is gone
-        if (p.due > now || (p.hold && !released)) {
+        if (!p.step.ready(now, released)) {
             keep.push_back(p);
             continue;
         }
-        if (p.close) {
+        if (p.step.close) {
             dropClient(s, p.client);
             continue;
         }
         // Answers exist only for a client that registered its callbacks.
         if (!c->registered) continue;
-        if (!wireSend(c->fd, p.type, p.serial, 0, p.payload)) dropClient(s, p.client);
+        if (!wireSend(c->fd, RADIO_WIRE_RESPONSE, p.serial, 0, p.step.frame)) dropClient(s, p.client);
     }
     pending_.swap(keep);
-}
-
-int RadioService::pollTimeout() const {
-    int timeout = 100;
-    long long now = nowMs();
-    for (const Pending &p : pending_) {
-        if (p.hold) timeout = std::min(timeout, 20);
-        long long left = p.due - now;
-        if (left < 0) left = 0;
-        if (left < timeout) timeout = static_cast<int>(left);
-    }
-    return timeout;
 }
 
 int RadioService::run() {
@@ -305,7 +279,7 @@ int RadioService::run() {
             fds.push_back({ttyFd_, POLLIN, 0});
             what.push_back({-2, 0});
         }
-        int r = poll(fds.data(), fds.size(), pollTimeout());
+        int r = poll(fds.data(), fds.size(), stepPollTimeout(pending_, nowMs()));
         if (r < 0 && errno != EINTR) break;
         for (size_t k = 0; r > 0 && k < fds.size(); k++) {
             if (!(fds[k].revents & (POLLIN | POLLHUP | POLLERR))) continue;
