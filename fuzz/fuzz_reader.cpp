@@ -153,7 +153,7 @@ extern "C" int __wrap_select(int n, fd_set *r, fd_set *w, fd_set *e, struct time
         for (int fd = 0; fd < n && !any; fd++) {
             // The pseudo-terminal hands bytes to the reading side a moment after
             // they were written: give it that moment.
-            if (FD_ISSET(fd, r) && readable(fd, fd == gSerialDevice.fd[DEVICE_SERIAL] ? 5 : 0)) any = true;
+            if (FD_ISSET(fd, r) && readable(fd, fd == gSerialDevice.fd[DEVICE_SERIAL] ? 1 : 0)) any = true;
         }
         if (!any) siglongjmp(gOut, 1);
     }
@@ -163,7 +163,7 @@ extern "C" int __wrap_select(int n, fd_set *r, fd_set *w, fd_set *e, struct time
 extern "C" ssize_t __real_read(int, void *, size_t);
 extern "C" ssize_t __wrap_read(int fd, void *buf, size_t n) {
     if (gArmed && (fd == gSerialDevice.fd[DEVICE_SERIAL] || fd == gSerialDevice.fd[DEVICE_ADB]) &&
-        !readable(fd, fd == gSerialDevice.fd[DEVICE_SERIAL] ? 5 : 0)) {
+        !readable(fd, fd == gSerialDevice.fd[DEVICE_SERIAL] ? 1 : 0)) {
         siglongjmp(gOut, 1);
     }
     return __real_read(fd, buf, n);
@@ -176,6 +176,7 @@ extern "C" int __wrap_usleep(useconds_t) { return 0; }
 namespace {
 
 bool gRoute = false;
+int gSerialFd = -1;  // the port as opened; the terminal never goes away in a run
 size_t gLines = 0;
 size_t gBudget = 0;
 
@@ -186,6 +187,12 @@ void runReader() {
         for (;;) {
             char *line = readline(&gSerialDevice);
             checkLine(line);
+            // Nothing a host sends may make the reader take the port for dead: a
+            // reopen flushes whatever the host has queued.
+            // (A reopen usually gets the same number back; only the original
+            // descriptor carries the close-on-exec mark set below.)
+            check(gSerialFd < 0 || (gSerialDevice.fd[DEVICE_SERIAL] == gSerialFd &&
+                                    (fcntl(gSerialFd, F_GETFD) & FD_CLOEXEC) != 0));
             // Each line or empty cycle consumes host input or ends a link; more of
             // them than bytes given is a loop that makes no progress.
             check(++gLines <= gBudget);
@@ -258,8 +265,11 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t *data, size_t size) {
         gSerialDevice.fd[DEVICE_ADB] = sv[0];
         gAdbHost = sv[1];
         gSerialDevice.currDevice = DEVICE_ADB;
+        gSerialFd = -1;
     } else {
         openSerial();
+        gSerialFd = gSerialDevice.fd[DEVICE_SERIAL];
+        fcntl(gSerialFd, F_SETFD, FD_CLOEXEC);
         gSerialDevice.currDevice = DEVICE_SERIAL;
     }
 

@@ -64,7 +64,7 @@ def reader():
         "serial-frame-ok": (0, [frame]),
         "serial-frame-49": (0, [frame[:12] + frame[14:]]),
         "serial-frame-short": (0, [b"at^mmitest=\x01\x02\n", b"AT\n"]),
-        "serial-eof": (0, [b"AT\n\x04", b"AT+CSQ\n"]),
+        "serial-ctrl-d": (0, [b"AT+CS\x04Q\n", b"\x04"]),
         "serial-sms-relay": (ROUTE, [b"AT+CMGS=\"123\"\n", b"\n", b"hello\x1a"]),
         "serial-sms-merge": (ROUTE | OP12 | TEXT, [b"AT+CMGF=1\n", b"AT+CMGS=\"123\"\n", b"\n", b"hi\x08i\n", b"there\x1a"]),
         "serial-sms-esc": (ROUTE | OP12, [b"AT+CMGS=12\n", b"0011\x1b"]),
