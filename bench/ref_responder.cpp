@@ -47,7 +47,8 @@ bool writeAll(int fd, const char *p, size_t n) {
 }
 
 // The settings tolkd gives its port (see `tolk-sim tty-settings`): canonical input
-// with echo, CR read as LF, Ctrl-Z and ESC also ending a line, no output processing.
+// with echo, CR read as LF, Ctrl-Z and ESC also ending a line, Ctrl-D plain data,
+// no output processing.
 int openSerial(const char *root) {
     char path[PATH_MAX];
     snprintf(path, sizeof path, "%s/dev/ttyGS0", root);
@@ -61,6 +62,7 @@ int openSerial(const char *root) {
         t.c_cc[VERASE] = 0x7f;
         t.c_cc[VEOL] = 0x1a;
         t.c_cc[VEOL2] = 0x1b;
+        t.c_cc[VEOF] = _POSIX_VDISABLE;  // Ctrl-D is data on tolkd's port too
         tcsetattr(fd, TCSANOW, &t);
     }
     return fd;
