@@ -4,7 +4,7 @@ BUILD_TYPE ?= RelWithDebInfo
 CMAKE_FLAGS ?=
 JOBS ?= $(shell nproc 2>/dev/null || echo 2)
 
-.PHONY: all run test deps configure build clean asan
+.PHONY: all run test deps configure build clean asan bench
 
 all: build
 
@@ -27,6 +27,10 @@ test: build
 # The whole suite under AddressSanitizer and UndefinedBehaviorSanitizer.
 asan:
 	$(MAKE) test BUILD=build-asan BUILD_TYPE=Debug CMAKE_FLAGS=-DTOLKD_SANITIZE=ON
+
+# Every performance measurement on a fresh simulated device, as one table.
+bench: build
+	tools/bench.sh
 
 clean:
 	rm -rf $(BUILD) build-asan
