@@ -29,7 +29,7 @@ asan:
 	$(MAKE) test BUILD=build-asan BUILD_TYPE=Debug CMAKE_FLAGS=-DTOLKD_SANITIZE=ON
 
 # Every performance measurement on a fresh simulated device, as one table.
-bench: build
+bench: deps
 	tools/bench.sh
 
 clean:
