@@ -3,6 +3,7 @@
 #include "targets/target_relay.h"
 
 #include <errno.h>
+#include <poll.h>
 #include <string.h>
 #include <sys/select.h>
 #include <sys/socket.h>
@@ -180,6 +181,13 @@ void audioReaderLoop(int target) {
     if (rc == 0) return;
     LOGD("Prepare read the data from audio driver");
     readDataFromTarget(target, fd);
+    // An answer longer than one read is already waiting in full: relay the rest
+    // now, piece by piece, rather than leave it to be dropped before the next command.
+    while (*fd >= 0) {
+        struct pollfd p = {*fd, POLLIN, 0};
+        if (poll(&p, 1, 0) != 1 || (p.revents & POLLIN) == 0) break;
+        readDataFromTarget(target, fd);
+    }
 }
 
 int sendDataToGenericService(const char *data) {

@@ -180,6 +180,13 @@ TEST_F(TargetLinks, AudioExchangesCarryExactBytes) {
     audioReaderLoop(BELVO_AUDIO_TYPE);
     EXPECT_EQ(answer, hostOutput());
 
+    // An answer longer than one read reaches the host whole, not just its first piece.
+    std::string big(10000, '\x5a');
+    big.replace(0, 3, "MM+");
+    sendAll(audio, big);
+    audioReaderLoop(BELVO_AUDIO_TYPE);
+    EXPECT_EQ(big.size(), hostOutput().size());
+
     sendAll(ext, "\r\nOK\r\n");
     audioReaderLoop(AUDIO_EXT_TYPE);
     EXPECT_EQ("\r\nOK\r\n", hostOutput());
