@@ -100,12 +100,6 @@ protected:
         alarm(0);
     }
 
-    int connectAdbClient() {
-        int fd = socket(AF_UNIX, SOCK_STREAM, 0);
-        EXPECT_EQ(0, connect(fd, (sockaddr *)&listenAddr, sizeof(listenAddr)));
-        return fd;
-    }
-
     // One reading cycle: the line as routing gets it, "<null>" for none.
     std::string nextLine() {
         char *line = readline(&gSerialDevice);

@@ -72,6 +72,7 @@ TEST_F(HalBridge, SlotComesFromTheSimSelection) {
         {"0", nullptr, 0}, {"1", nullptr, 1}, {"2", nullptr, 2}, {"3", nullptr, 3},
         {"9", nullptr, 0},  // CDMA slot defaults to the first
         {"9", "2", 1},      {"9", "1", 0},    {"9", "0", -1},   {"4", nullptr, -1},
+        {"9", "-2147483648", -1},  // regression: atoi minus one overflowed here (seen under UBSan)
         {"-1", nullptr, -1}, {"8", nullptr, -1}, {"10", nullptr, -1},
     };
     for (const auto &c : cases) {
@@ -118,29 +119,6 @@ TEST_F(HalBridge, CommandGoesToTheSelectedSlotWithItsNulAndAnswersComeBackThroug
     ASSERT_TRUE(slot2.waitFrames(3));
     EXPECT_EQ(1, slot2.connections());
     EXPECT_EQ(RADIO_WIRE_REQUEST, slot2.frames()[2].type);
-}
-
-TEST_F(HalBridge, MissingServiceOrSlotAnswersNoModemAndStillMarksTheCommand) {
-    // No service at all.
-    EXPECT_EQ(0, sendDataToRild("AT+CSQ"));
-    EXPECT_TRUE(isATCmdInject);
-    EXPECT_EQ("\r\nERROR:No Modem\r\n", host_.drain());
-
-    // An unsupported selection refuses without touching any service.
-    FakeRadioService slot1(slotPath("slot1"));
-    ASSERT_TRUE(slot1.ok());
-    ASSERT_EQ(0, property_set("persist.service.tolk.sim", "4"));
-    isATCmdInject = false;
-    EXPECT_FALSE(sendRequest("AT", 3));
-    EXPECT_EQ(0, sendDataToRild("AT"));
-    EXPECT_TRUE(isATCmdInject);
-    EXPECT_EQ("\r\nERROR:No Modem\r\n", host_.drain());
-    EXPECT_EQ(0, slot1.connections());
-
-    // Back to slot 0: the service that appeared meanwhile is found.
-    ASSERT_EQ(0, property_set("persist.service.tolk.sim", "0"));
-    EXPECT_TRUE(sendRequest("AT", 3));
-    EXPECT_TRUE(slot1.waitFrames(2));
 }
 
 TEST_F(HalBridge, TransportFailureDropsTheProxyAndTheNextRequestSetsUpAgain) {
@@ -217,17 +195,3 @@ TEST_F(HalBridge, NewModemPairReplacesAndClosesTheOldBridgeEnd) {
     EXPECT_EQ("OK", drainFd(s_fdRild_command));
 }
 
-TEST_F(HalBridge, LineWithSubOrEscEndsSmsTextInput) {
-    FakeRadioService slot1(slotPath("slot1"));
-    ASSERT_TRUE(slot1.ok());
-    isMsgCmdInput = true;
-    sendDataToRild("hello");
-    EXPECT_TRUE(isMsgCmdInput);
-    sendDataToRild("hello\x1a");
-    EXPECT_FALSE(isMsgCmdInput);
-    isMsgCmdInput = true;
-    sendDataToRild("\x1b");
-    EXPECT_FALSE(isMsgCmdInput);
-    ASSERT_TRUE(slot1.waitFrames(4));
-    EXPECT_EQ(std::string("hello\x1a\0", 7), slot1.frames()[2].payload);
-}

@@ -31,20 +31,6 @@ protected:
     void write(const std::string &data) { writeDataToSerialByAudioType(data.data(), static_cast<int>(data.size())); }
 };
 
-TEST_F(AudioWriterTest, BytesPassUnchanged) {
-    const int host = link(DEVICE_SERIAL);
-    // A 51-byte test frame with NUL, CR and LF inside and at its ends.
-    const std::string frame = std::string("\0\r\nMM\x01\xff\r\n", 9) + pattern(40) + "\r\n";
-    write(frame);
-    EXPECT_EQ(frame, readFor(host, 0, 100));
-
-    // No adb connection open: nothing goes anywhere.
-    gSerialDevice.currDevice = DEVICE_ADB;
-    write("AUD");
-    writeDataToSerialByAudioType(nullptr, 5);
-    EXPECT_EQ("", readFor(host, 0, 50));
-}
-
 TEST_F(AudioWriterTest, FullLinkGetsEveryByteOnceInOrder) {
     // A non-blocking link with a small send buffer: writes come back short or with
     // EAGAIN until the host starts reading, after the first wait budget is spent.

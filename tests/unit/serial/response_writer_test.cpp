@@ -1,9 +1,7 @@
-// The text writer: framing, numeric result codes, raw audio answers, the link chosen,
-// and the final-result prefixes. The host end of each link is a SOCK_SEQPACKET
-// socket, so every write() of the writer arrives as one record.
+// The text writer: framing, numeric result codes, raw audio answers and the
+// final-result prefixes. The host end of the link is a SOCK_SEQPACKET socket, so
+// every write() of the writer arrives as one record.
 #include <sys/socket.h>
-
-#include <tuple>
 
 #include "serial_test_util.h"
 
@@ -16,11 +14,8 @@ protected:
     void SetUp() override {
         SerialFixture::SetUp();
         ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_SEQPACKET, 0, serial_));
-        ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_SEQPACKET, 0, adb_));
         gSerialDevice.fd[DEVICE_SERIAL] = serial_[0];
-        gSerialDevice.fd[DEVICE_ADB] = adb_[0];
         own(serial_[1]);
-        own(adb_[1]);
     }
     static Records records(int fd) {
         Records out;
@@ -39,7 +34,6 @@ protected:
     std::string hostGets(const std::string &data) { return hostGets(data.data(), static_cast<int>(data.size())); }
 
     int serial_[2] = {-1, -1};
-    int adb_[2] = {-1, -1};
 };
 
 TEST_F(ResponseWriterTest, FramesAnswersOnce) {
@@ -82,25 +76,6 @@ TEST_F(ResponseWriterTest, NumericMode) {
     }
 }
 
-TEST_F(ResponseWriterTest, ResponseTypesInBothModes) {
-    const std::tuple<int, const char *, const char *> cases[] = {
-        {RESPONSE_OK, "\r\nOK\r\n", "\r\n0\r\n"},
-        {RESPONSE_DONE, "\r\n\r\n", "\r\n\r\n"},
-        {RESPONSE_ERROR, "\r\nERROR\r\n", "\r\n4\r\n"},
-        {RESPONSE_NOT_IMPLEMENTED, "\r\nNot Implement\r\n", "\r\nNot Implement\r\n"},
-        {RESPONSE_INVALID, "\r\nUNKNOWN\r\n", "\r\nUNKNOWN\r\n"},
-        {2, "\r\nUNKNOWN\r\n", "\r\nUNKNOWN\r\n"},
-    };
-    for (const auto &c : cases) {
-        gNumericMode = false;
-        writeDataToserialByResponseType(std::get<0>(c));
-        EXPECT_EQ(Records{std::get<1>(c)}, records(serial_[1])) << std::get<0>(c);
-        gNumericMode = true;
-        writeDataToserialByResponseType(std::get<0>(c));
-        EXPECT_EQ(Records{std::get<2>(c)}, records(serial_[1])) << std::get<0>(c);
-    }
-}
-
 TEST_F(ResponseWriterTest, AudioAnswersPassRaw) {
     for (bool numeric : {false, true}) {
         gNumericMode = numeric;
@@ -115,27 +90,9 @@ TEST_F(ResponseWriterTest, AudioAnswersPassRaw) {
     EXPECT_EQ("\r\nMm\r\n", hostGets("Mm"));
 }
 
-TEST_F(ResponseWriterTest, WritesToLinkOfCurrentLine) {
-    for (int dev : {DEVICE_ADB_LISTEN, DEVICE_ADB}) {
-        gSerialDevice.currDevice = dev;
-        writeDataToSerial("OK", 2);
-        EXPECT_EQ(Records{"\r\nOK\r\n"}, records(adb_[1])) << dev;
-    }
-    // A closed adb connection: nothing is written anywhere.
-    close(gSerialDevice.fd[DEVICE_ADB]);
-    gSerialDevice.fd[DEVICE_ADB] = -1;
-    EXPECT_EQ(-1, writeDataToSerial("OK", 2));
-    EXPECT_TRUE(records(serial_[1]).empty());
-    EXPECT_TRUE(records(adb_[1]).empty());
-}
-
+// The relay's table covers the common prefixes; these are the edges.
 TEST(FinalResult, PrefixMatch) {
-    for (const char *end : {"+CMGS: 12\r\n", "\r\nOK\r\n", "\r\n+CMS ERROR: 500", "ERROR", "\r\n+CNMA: 0"}) {
-        EXPECT_TRUE(isFinalResult(end, static_cast<int>(strlen(end)))) << end;
-    }
-    for (const char *other : {"+CMGS 12", "\n\rOK", "ok", "\r\n+CSQ: 1"}) {
-        EXPECT_FALSE(isFinalResult(other, static_cast<int>(strlen(other)))) << other;
-    }
+    EXPECT_TRUE(isFinalResult("\r\n+CNMA: 0", 10));
     // The prefix must lie within the bytes received.
     EXPECT_FALSE(isFinalResult("\r\nOK", 3));
     EXPECT_FALSE(isFinalResult(nullptr, 10));

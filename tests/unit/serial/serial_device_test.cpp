@@ -2,10 +2,7 @@
 // the echo switch and the MMI test option set with its restore.
 #include <sys/socket.h>
 
-#include <filesystem>
-
 #include "serial_test_util.h"
-#include "test_root.h"
 
 namespace {
 
@@ -153,28 +150,6 @@ TEST_F(SerialDeviceTest, RestoreWithoutEnableLeavesPortAlone) {
     // Nothing was saved: an empty record would switch off the receiver and speed.
     setMMITESTOption(0);
     EXPECT_TRUE(sameSettings(opened, settingsOf(fd)));
-}
-
-TEST_F(SerialDeviceTest, GadgetPortUnderDeviceRoot) {
-    TestRoot root;
-    std::filesystem::create_directories(root.at("/dev"));
-    std::filesystem::create_symlink(pty_.slavePath, root.at(SERIAL_DEV_NAME));
-
-    // A fresh record has echo on; the gadget port gets exactly ONLCR for output.
-    const int fd = open_serial_device(&gSerialDevice, SERIAL_DEV_NAME);
-    if (fd < 0) GTEST_SKIP() << "open() is not redirected under the device root in this build";
-    gSerialDevice.fd[DEVICE_SERIAL] = fd;
-    struct termios t = settingsOf(fd);
-    EXPECT_EQ(static_cast<tcflag_t>(ONLCR), t.c_oflag);
-    EXPECT_EQ(static_cast<tcflag_t>(ICANON | ECHO | IEXTEN), t.c_lflag);
-    EXPECT_EQ(0x1B, t.c_cc[VEOL2]);
-
-    // After ATE0 a reopen keeps echo off.
-    ASSERT_EQ(0, setEchoOption(0));
-    close(fd);
-    gSerialDevice.fd[DEVICE_SERIAL] = open_serial_device(&gSerialDevice, SERIAL_DEV_NAME);
-    ASSERT_GE(gSerialDevice.fd[DEVICE_SERIAL], 0);
-    EXPECT_EQ(static_cast<tcflag_t>(ICANON | IEXTEN), settingsOf(gSerialDevice.fd[DEVICE_SERIAL]).c_lflag);
 }
 
 }  // namespace
