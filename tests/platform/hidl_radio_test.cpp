@@ -101,67 +101,26 @@ struct Death : hidl_death_recipient {
 
 }  // namespace
 
-TEST(HidlRadio, GetServiceFindsOnlyRunningInstances) {
-    TestRoot root;
-    EXPECT_EQ(nullptr, IRadio::getService("slot1", false));
-
-    FakeRadioService service(instancePath(root, "slot2"));
-    ASSERT_TRUE(service.ok());
-    EXPECT_EQ(nullptr, IRadio::getService("slot1", false));
-    sp<IRadio> radio = IRadio::getService("slot2", false);
-    ASSERT_NE(nullptr, radio);
-    EXPECT_TRUE(radio->isRemote());
-    EXPECT_TRUE(radio->ping().isOk());
-    EXPECT_TRUE(service.waitConnections(1));
-
-    // No passthrough implementation, and names cannot leave the instance folder.
-    EXPECT_EQ(nullptr, IRadio::getService("slot2", true));
-    EXPECT_EQ(nullptr, IRadio::getService("../radio.slot2", false));
-    EXPECT_EQ(nullptr, IRadio::getService("", false));
-
-    service.stop();
-    EXPECT_EQ(nullptr, IRadio::getService("slot2", false));
-}
-
-TEST(HidlRadio, RequestsReachTheServiceAndCallbacksArriveInOrderOnOneRuntimeThread) {
+// Request and answer bytes go through the radio HAL bridge's tests, an absent or
+// restarted service through the end-to-end modem tests; here the runtime's threads.
+TEST(HidlRadio, CallbacksArriveInOrderOnOneRuntimeThread) {
     TestRoot root;
     FakeRadioService service(instancePath(root, "slot1"));
     ASSERT_TRUE(service.ok());
+    EXPECT_EQ(nullptr, IRadio::getService("../radio.slot1", false));  // names stay in the folder
     sp<IRadio> radio = IRadio::getService("slot1", false);
     ASSERT_NE(nullptr, radio);
 
     Recorder rec;
-    sp<Response> response = new Response(&rec);
-    sp<Indication> indication = new Indication(&rec);
-    EXPECT_TRUE(radio->registerTolkCallbacks(response, indication).isOk());
-
-    const char line[] = "AT+CSQ";
-    hidl_vec<uint8_t> request;
-    request.setToExternal(reinterpret_cast<uint8_t *>(const_cast<char *>(line)), sizeof(line));
-    EXPECT_TRUE(radio->sendTolkRequest(-1, request).isOk());
-
-    ASSERT_TRUE(service.waitFrames(2));
-    auto frames = service.frames();
-    EXPECT_EQ(RADIO_WIRE_REGISTER, frames[0].type);
-    EXPECT_EQ(RADIO_WIRE_REQUEST, frames[1].type);
-    EXPECT_EQ(-1, frames[1].serial);
-    EXPECT_EQ(std::string("AT+CSQ\0", 7), frames[1].payload);
-
+    EXPECT_TRUE(radio->registerTolkCallbacks(new Response(&rec), new Indication(&rec)).isOk());
+    ASSERT_TRUE(service.waitFrames(1));
     std::vector<std::string> expected;
     for (int i = 0; i < 40; i++) {
         std::string text = "line" + std::to_string(i);
-        if (i % 3 == 0) {
-            ASSERT_TRUE(service.indicate(text));
-            expected.push_back("I:" + text);
-        } else {
-            ASSERT_TRUE(service.respond(text));
-            expected.push_back("R:" + text);
-        }
+        bool ind = i % 3 == 0;
+        ASSERT_TRUE(ind ? service.indicate(text) : service.respond(text));
+        expected.push_back((ind ? "I:" : "R:") + text);
     }
-    // Payload bytes pass unchanged, NULs and CR LF included.
-    ASSERT_TRUE(service.respond(std::string("\r\nOK\r\n\0x", 9)));
-    expected.push_back("R:" + std::string("\r\nOK\r\n\0x", 9));
-
     ASSERT_TRUE(rec.wait(expected.size()));
     std::lock_guard<std::mutex> lock(rec.mutex);
     EXPECT_EQ(expected, rec.events);
@@ -192,9 +151,7 @@ TEST(HidlRadio, DeathIsNotifiedOnceAndLaterSendsFailWithoutSigpipe) {
     std::this_thread::sleep_for(std::chrono::milliseconds(50));
     {
         std::lock_guard<std::mutex> lock(rec.mutex);
-        ASSERT_EQ(1u, rec.events.size());
-        EXPECT_EQ("D:7", rec.events[0]);
-        EXPECT_NE(std::this_thread::get_id(), rec.threads[0]);
+        EXPECT_EQ(std::vector<std::string>{"D:7"}, rec.events);
     }
     EXPECT_EQ(radio.get(), death->who.promote().get());
 
@@ -204,26 +161,6 @@ TEST(HidlRadio, DeathIsNotifiedOnceAndLaterSendsFailWithoutSigpipe) {
     request.setToExternal(b, sizeof(b));
     EXPECT_FALSE(radio->sendTolkRequest(-1, request).isOk());
     EXPECT_FALSE(radio->ping().isOk());
-    EXPECT_FALSE(radio->registerTolkCallbacks(nullptr, nullptr).isOk());
-}
-
-TEST(HidlRadio, ReleasedProxyStopsDeliveringAndNeverNotifiesDeath) {
-    TestRoot root;
-    FakeRadioService service(instancePath(root, "slot4"));
-    ASSERT_TRUE(service.ok());
-    Recorder rec;
-    sp<Death> death = new Death(&rec);
-    {
-        sp<IRadio> radio = IRadio::getService("slot4", false);
-        ASSERT_NE(nullptr, radio);
-        radio->linkToDeath(death, 1);
-        ASSERT_TRUE(service.waitConnections(1));
-    }
-    // The service sees the connection end, as when the client process lets go.
-    ASSERT_TRUE(eventually([&] { return !service.respond("late"); }));
-    std::this_thread::sleep_for(std::chrono::milliseconds(50));
-    std::lock_guard<std::mutex> lock(rec.mutex);
-    EXPECT_TRUE(rec.events.empty());
 }
 
 TEST(HidlRadio, ProxyCanBeReleasedFromItsOwnCallbackThread) {
@@ -252,7 +189,7 @@ TEST(HidlRadio, ProxyCanBeReleasedFromItsOwnCallbackThread) {
     EXPECT_TRUE(eventually([&] { return !service.respond("y"); }));
 }
 
-TEST(HidlRadio, ReleasingWhileTheCallbackWaitsForTheReleasersLockDoesNotDeadlock) {
+TEST(HidlRadio, ReleasingWhileTheCallbackWaitsForTheReleasersLockDoesNotDeadlockNorReportDeath) {
     TestRoot root;
     FakeRadioService service(instancePath(root, "slot2"));
     ASSERT_TRUE(service.ok());
@@ -266,6 +203,8 @@ TEST(HidlRadio, ReleasingWhileTheCallbackWaitsForTheReleasersLockDoesNotDeadlock
         std::lock_guard<std::mutex> lock(bridgeLock);
         callbackDone = true;
     };
+    sp<Death> death = new Death(&rec);
+    radio->linkToDeath(death, 1);
     radio->registerTolkCallbacks(response, nullptr);
     ASSERT_TRUE(service.waitFrames(1));
 
@@ -276,4 +215,9 @@ TEST(HidlRadio, ReleasingWhileTheCallbackWaitsForTheReleasersLockDoesNotDeadlock
     EXPECT_FALSE(callbackDone.load());
     held.unlock();
     EXPECT_TRUE(eventually([&] { return callbackDone.load(); }));
+    // The service sees the connection end; a released proxy never reports a death.
+    ASSERT_TRUE(eventually([&] { return !service.respond("late"); }));
+    std::this_thread::sleep_for(std::chrono::milliseconds(50));
+    std::lock_guard<std::mutex> lock(rec.mutex);
+    EXPECT_EQ(std::vector<std::string>{"R:answer"}, rec.events);
 }
