@@ -8,10 +8,11 @@
 
 #include <gtest/gtest.h>
 
-#include <ftw.h>
+#include "eventually.h"
+#include "test_root.h"
+
 #include <poll.h>
 #include <signal.h>
-#include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -19,34 +20,14 @@ using namespace tolksim;
 
 namespace {
 
-int removeEntry(const char *path, const struct stat *, int, struct FTW *) { return remove(path); }
-
-bool waitFor(const std::string &path, int ms = 3000) {
-    for (int i = 0; i < ms / 10; i++) {
-        int fd = connectUnix(path);
-        if (fd >= 0) {
-            close(fd);
-            return true;
-        }
-        usleep(10000);
-    }
-    return false;
-}
-
-// A peer running in a child process, stopped with SIGTERM like tolk-sim does.
+// The radio service in a child process, stopped with SIGTERM like tolk-sim does.
 class Peer {
 public:
-    Peer() {
-        char dir[] = "/tmp/simpeerXXXXXX";
-        root_ = mkdtemp(dir);
-        pid_ = fork();
-        if (pid_ == 0) _exit(run_radio_peer(root_, {}));
+    Peer() : pid_(fork()) {
+        if (pid_ == 0) _exit(run_radio_peer(root_.path(), {}));
     }
     ~Peer() {
         if (pid_ > 0) stop();
-        // Not system("rm -rf"): the daemon's libraries linked here journal shell
-        // commands instead of running them.
-        nftw(root_.c_str(), removeEntry, 16, FTW_DEPTH | FTW_PHYS);
     }
     int stop() {
         kill(pid_, SIGTERM);
@@ -55,11 +36,10 @@ public:
         pid_ = -1;
         return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
     }
-    const std::string &root() const { return root_; }
+    TestRoot root_;  // removed with the peer; declared first, made before the fork
 
 private:
-    std::string root_;
-    pid_t pid_ = -1;
+    pid_t pid_;
 };
 
 // Sends a frame; a non-empty text goes as the daemon sends it, with its NUL.
@@ -77,9 +57,10 @@ std::string recvFrame(int fd, RadioWireHeader *h, int ms = 2000) {
 }
 
 int connectSlot(const Peer &p, int slot) {
-    std::string path = p.root() + "/dev/hwbinder/radio.slot" + std::to_string(slot);
-    EXPECT_TRUE(waitFor(path)) << path;
-    return connectUnix(path);
+    std::string path = p.root_.at("/dev/hwbinder/radio.slot" + std::to_string(slot));
+    int fd = -1;
+    EXPECT_TRUE(eventually([&] { return (fd = connectUnix(path)) >= 0; })) << path;
+    return fd;
 }
 
 }  // namespace
@@ -99,9 +80,9 @@ TEST(RadioPeer, AnswersOnlyAfterRegisterAndJournalsEveryRequest) {
     EXPECT_EQ(h.serial, -1);
     sendFrame(fd, RADIO_WIRE_REQUEST, "AT+CMGS=\"1\"");
     EXPECT_EQ(recvFrame(fd, &h), "\r\n> ");
-    EXPECT_EQ(sim::readFileOr(peer.root() + "/journal/radio.slot2.log"),
+    EXPECT_EQ(peer.root_.read("/journal/radio.slot2.log"),
               "AT+CGSN\\x00\nAT+CGSN\\x00\nAT+CMGS=\"1\"\\x00\n");
-    EXPECT_EQ(sim::readFileOr(peer.root() + "/journal/radio.slot1.log"), "");
+    EXPECT_EQ(peer.root_.read("/journal/radio.slot1.log"), "");
 
     // The daemon reconnects after it saw the service die: a new connection is
     // served the same way, and the slot's modem has forgotten the unfinished message.
