@@ -99,19 +99,28 @@ struct Death : hidl_death_recipient {
     wp<IBase> who;
 };
 
+// A fresh root with one running instance and a proxy to it. Members go in reverse:
+// the proxy first, the recorder (which waits for running callbacks) after the
+// service, the lock that callbacks take last.
+struct HidlRadio : ::testing::Test {
+    void SetUp() override {
+        ASSERT_TRUE(service.ok());
+        radio = IRadio::getService("slot1", false);
+        ASSERT_NE(nullptr, radio);
+    }
+    std::mutex lock;
+    Recorder rec;
+    TestRoot root;
+    FakeRadioService service{instancePath(root, "slot1")};
+    sp<IRadio> radio;
+};
+
 }  // namespace
 
 // Request and answer bytes go through the radio HAL bridge's tests, an absent or
 // restarted service through the end-to-end modem tests; here the runtime's threads.
-TEST(HidlRadio, CallbacksArriveInOrderOnOneRuntimeThread) {
-    TestRoot root;
-    FakeRadioService service(instancePath(root, "slot1"));
-    ASSERT_TRUE(service.ok());
+TEST_F(HidlRadio, CallbacksArriveInOrderOnOneRuntimeThread) {
     EXPECT_EQ(nullptr, IRadio::getService("../radio.slot1", false));  // names stay in the folder
-    sp<IRadio> radio = IRadio::getService("slot1", false);
-    ASSERT_NE(nullptr, radio);
-
-    Recorder rec;
     EXPECT_TRUE(radio->registerTolkCallbacks(new Response(&rec), new Indication(&rec)).isOk());
     ASSERT_TRUE(service.waitFrames(1));
     std::vector<std::string> expected;
@@ -122,7 +131,7 @@ TEST(HidlRadio, CallbacksArriveInOrderOnOneRuntimeThread) {
         expected.push_back((ind ? "I:" : "R:") + text);
     }
     ASSERT_TRUE(rec.wait(expected.size()));
-    std::lock_guard<std::mutex> lock(rec.mutex);
+    std::lock_guard<std::mutex> hold(rec.mutex);
     EXPECT_EQ(expected, rec.events);
     for (const auto &id : rec.threads) {
         EXPECT_NE(std::this_thread::get_id(), id);
@@ -130,14 +139,7 @@ TEST(HidlRadio, CallbacksArriveInOrderOnOneRuntimeThread) {
     }
 }
 
-TEST(HidlRadio, DeathIsNotifiedOnceAndLaterSendsFailWithoutSigpipe) {
-    TestRoot root;
-    FakeRadioService service(instancePath(root, "slot3"));
-    ASSERT_TRUE(service.ok());
-    sp<IRadio> radio = IRadio::getService("slot3", false);
-    ASSERT_NE(nullptr, radio);
-
-    Recorder rec;
+TEST_F(HidlRadio, DeathIsNotifiedOnceAndLaterSendsFailWithoutSigpipe) {
     sp<Death> death = new Death(&rec);
     sp<Death> unlinked = new Death(&rec);
     EXPECT_TRUE(radio->linkToDeath(death, 7).isOk());
@@ -150,7 +152,7 @@ TEST(HidlRadio, DeathIsNotifiedOnceAndLaterSendsFailWithoutSigpipe) {
     ASSERT_TRUE(rec.wait(1));
     std::this_thread::sleep_for(std::chrono::milliseconds(50));
     {
-        std::lock_guard<std::mutex> lock(rec.mutex);
+        std::lock_guard<std::mutex> hold(rec.mutex);
         EXPECT_EQ(std::vector<std::string>{"D:7"}, rec.events);
     }
     EXPECT_EQ(radio.get(), death->who.promote().get());
@@ -163,61 +165,45 @@ TEST(HidlRadio, DeathIsNotifiedOnceAndLaterSendsFailWithoutSigpipe) {
     EXPECT_FALSE(radio->ping().isOk());
 }
 
-TEST(HidlRadio, ProxyCanBeReleasedFromItsOwnCallbackThread) {
-    TestRoot root;
-    FakeRadioService service(instancePath(root, "slot1"));
-    ASSERT_TRUE(service.ok());
-    std::mutex holder;  // declared first: outlives the recorder's wait for callbacks
-    Recorder rec;
-    sp<Response> response = new Response(&rec);
-    sp<IRadio> radio = IRadio::getService("slot1", false);
-    ASSERT_NE(nullptr, radio);
+TEST_F(HidlRadio, ProxyCanBeReleasedFromItsOwnCallbackThread) {
     // The callback drops the last reference: the destructor runs on the reader
     // thread itself and must neither join it nor crash.
     rec.hook = [&] {
-        std::lock_guard<std::mutex> lock(holder);
+        std::lock_guard<std::mutex> hold(lock);
         radio.clear();
     };
-    radio->registerTolkCallbacks(response, nullptr);
+    radio->registerTolkCallbacks(new Response(&rec), nullptr);
     ASSERT_TRUE(service.waitFrames(1));
     ASSERT_TRUE(service.respond("x"));
     ASSERT_TRUE(rec.wait(1));
     ASSERT_TRUE(eventually([&] {
-        std::lock_guard<std::mutex> lock(holder);
+        std::lock_guard<std::mutex> hold(lock);
         return radio == nullptr;
     }));
     EXPECT_TRUE(eventually([&] { return !service.respond("y"); }));
 }
 
-TEST(HidlRadio, ReleasingWhileTheCallbackWaitsForTheReleasersLockDoesNotDeadlockNorReportDeath) {
-    TestRoot root;
-    FakeRadioService service(instancePath(root, "slot2"));
-    ASSERT_TRUE(service.ok());
-    std::mutex bridgeLock;
+TEST_F(HidlRadio, ReleasingWhileTheCallbackWaitsForTheReleasersLockDoesNotDeadlockNorReportDeath) {
     std::atomic<bool> callbackDone{false};
-    Recorder rec;
-    sp<Response> response = new Response(&rec);
-    sp<IRadio> radio = IRadio::getService("slot2", false);
-    ASSERT_NE(nullptr, radio);
     rec.hook = [&] {
-        std::lock_guard<std::mutex> lock(bridgeLock);
+        std::lock_guard<std::mutex> hold(lock);
         callbackDone = true;
     };
-    sp<Death> death = new Death(&rec);
+    sp<Death> death = new Death(&rec);  // kept: the proxy holds recipients weakly
     radio->linkToDeath(death, 1);
-    radio->registerTolkCallbacks(response, nullptr);
+    radio->registerTolkCallbacks(new Response(&rec), nullptr);
     ASSERT_TRUE(service.waitFrames(1));
 
-    std::unique_lock<std::mutex> held(bridgeLock);
+    std::unique_lock<std::mutex> held(lock);
     ASSERT_TRUE(service.respond("answer"));
-    ASSERT_TRUE(rec.wait(1));  // the callback now waits for bridgeLock
-    radio.clear();             // with bridgeLock held: must return at once
+    ASSERT_TRUE(rec.wait(1));  // the callback now waits for the lock
+    radio.clear();             // with the lock held: must return at once
     EXPECT_FALSE(callbackDone.load());
     held.unlock();
     EXPECT_TRUE(eventually([&] { return callbackDone.load(); }));
     // The service sees the connection end; a released proxy never reports a death.
     ASSERT_TRUE(eventually([&] { return !service.respond("late"); }));
     std::this_thread::sleep_for(std::chrono::milliseconds(50));
-    std::lock_guard<std::mutex> lock(rec.mutex);
+    std::lock_guard<std::mutex> hold(rec.mutex);
     EXPECT_EQ(std::vector<std::string>{"R:answer"}, rec.events);
 }
