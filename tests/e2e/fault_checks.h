@@ -51,10 +51,8 @@ inline int settledFdCount(const SimDevice &d, int expected) {
     return n;
 }
 
-// The descriptor count with no adb connection open: a local command on a new
-// connection replaces any held one, and the daemon closes it once the host has.
-inline int baselineFds(SimDevice &d) {
-    d.at("AT+CSDF?", true);
+// The descriptor count once it has stopped changing.
+inline int stableFdCount(const SimDevice &d) {
     int n = d.tolkdFdCount(), prev = -2;
     for (int i = 0; i < 50 && n != prev; i++) {
         usleep(40 * 1000);
@@ -62,6 +60,13 @@ inline int baselineFds(SimDevice &d) {
         n = d.tolkdFdCount();
     }
     return n;
+}
+
+// The descriptor count with no adb connection open: a local command on a new
+// connection replaces any held one, and the daemon closes it once the host has.
+inline int baselineFds(SimDevice &d) {
+    d.at("AT+CSDF?", true);
+    return stableFdCount(d);
 }
 
 // Resident memory of the daemon in kB (VmRSS), -1 when unknown.

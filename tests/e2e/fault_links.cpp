@@ -24,6 +24,8 @@ bool adbQuery(int fd) {
     return readUntil(fd, "OK\r\n", 3000) == kCsdfAnswer;
 }
 
+// Each replug reopens the port (the old one closed: expectServing counts the
+// descriptors), keeps the echo setting, and never disturbs the adb link.
 TEST(FaultLinks, CableReplugsDuringTraffic) {
     SimDevice d;
     ASSERT_TRUE(d.started()) << d.upOutput();
@@ -48,7 +50,7 @@ TEST(FaultLinks, CableReplugsDuringTraffic) {
     });
     // A line typed before the daemon has reopened and set up the new port is
     // flushed with the port's stale input; wait for its settings to come back.
-    const std::string settings = d.sim({"tty-settings"});
+    std::string settings = d.sim({"tty-settings"});
     const int kReplugs = 10;
     for (int i = 1; i <= kReplugs; i++) {
         int status = -1;
@@ -56,26 +58,18 @@ TEST(FaultLinks, CableReplugsDuringTraffic) {
         ASSERT_EQ(0, status);
         for (int t = 0; t < 100 && d.sim({"tty-settings"}) != settings; t++) usleep(50 * 1000);
         std::string got = d.at("AT+CSDF?");
-        EXPECT_NE(std::string::npos, got.find(kCsdfAnswer)) << "after replug " << i << ": " << visible(got);
+        EXPECT_EQ(visible(i < kReplugs ? "AT+CSDF?\n" + std::string(kCsdfAnswer) : kCsdfAnswer), visible(got))
+            << "after replug " << i;
+        if (i == kReplugs - 1) {
+            EXPECT_EQ("ATE0\n\r\nOK\r\n", d.at("ATE0")) << "echo off before the last one";
+            settings = d.sim({"tty-settings"});
+        }
     }
     stop = true;
     adbHost.join();
     EXPECT_GT(asked.load(), 0);
     EXPECT_EQ(asked.load(), answered.load()) << "the adb link is not touched by the serial port's loss";
     expectServing(d, fds, "after the replugs");
-}
-
-TEST(FaultLinks, CablePulledForGoodDuringTraffic) {
-    SimDevice d;
-    ASSERT_TRUE(d.started()) << d.upOutput();
-    int fd = d.connectAdb();
-    ASSERT_GE(fd, 0);
-    EXPECT_TRUE(adbQuery(fd));
-    int status = -1;
-    d.sim({"unplug"}, &status);
-    ASSERT_EQ(0, status);
-    EXPECT_EQ(1, d.tolkdExitStatus(5000));
-    close(fd);
 }
 
 // Connections that say nothing, half a line or a whole one, a thousand times. A
@@ -204,6 +198,8 @@ TEST(FaultLinks, StrayBytesOnBothLinks) {
         {"\xff\xfe\r", "", ""},
         {std::string("\0\0\r", 3), "", ""},
         {"\r\r\r", "", ""},
+        {"A\r", "", ""},
+        {"XY+CSDF?\r", "", ""},
         {"\x1a\r", "", ""},
         {"\x1b\r", "", ""},
         {"\b\b\bAT+CSQ\r", kCsq, "AT+CSQ\\x00\n"},

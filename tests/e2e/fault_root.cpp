@@ -28,11 +28,12 @@ TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
     } slots[] = {
         {"abc", "1", "\r\n350000000000001\r\n\r\nOK\r\n"},  // no number reads as 0: slot 1
         {"3", "1", "\r\n350000000000004\r\n\r\nOK\r\n"},
+        {"9", "2", "\r\n350000000000002\r\n\r\nOK\r\n"},
+        {"9", "1", "\r\n350000000000001\r\n\r\nOK\r\n"},
         {"4", "1", kNoModem},
         {"-1", "1", kNoModem},
-        {"9", "2", "\r\n350000000000002\r\n\r\nOK\r\n"},
-        {"9", "xyz", kNoModem},
         {"9", "0", kNoModem},
+        {"9", "xyz", kNoModem},
         {"9", "5", kNoModem},
         {"9", "-2147483648", kNoModem},  // one below would overflow
         {"9", "2147483647", kNoModem},
@@ -62,30 +63,6 @@ TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
     d.setprop("sys.usb.config", std::string(91, 'm'));
     EXPECT_EQ("\r\n@USBCONFIG: \"" + std::string(91, 'm') + "\"\r\n\r\nOK\r\n\r\nOK\r\n", d.at("AT@USBCONFIG?", true));
     expectServing(d, fds, "after the property cases");
-}
-
-TEST(FaultRoot, BootModeFileOfAnyShape) {
-    struct Case {
-        std::vector<std::string> args;
-        bool serves;
-    } cases[] = {
-        {{"--no-boot-mode"}, true},
-        {{"--boot-mode", ""}, true},
-        {{"--boot-mode", "x5"}, true},
-        {{"--boot-mode", "\xff\xfe"}, true},
-        {{"--boot-mode", "57"}, false},  // only the first character counts
-    };
-    for (const Case &c : cases) {
-        SCOPED_TRACE(visible(c.args.back()));
-        SimDevice d(c.args);
-        if (c.serves) {
-            ASSERT_TRUE(d.started()) << d.upOutput();
-            EXPECT_EQ(visible(kCsdfAnswer), visible(d.at("AT+CSDF?", true)));
-        } else {
-            EXPECT_FALSE(d.started());
-            EXPECT_EQ(0, d.tolkdExitStatus(3000));
-        }
-    }
 }
 
 TEST(FaultRoot, StoresAndDeviceFilesMissingOrMisshaped) {
@@ -155,6 +132,7 @@ TEST(FaultRoot, StoresAndDeviceFilesMissingOrMisshaped) {
         EXPECT_EQ(visible(c.gbv), visible(d.at("AT@GBV", true)));
     }
     rmdir(adc.c_str());
+    EXPECT_EQ("\r\n0\r\nOK\r\n", d.at("AT@SCC", true)) << "the charger switch without the device";
     expectServing(d, fds, "after the file cases");
 }
 

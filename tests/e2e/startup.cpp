@@ -10,32 +10,17 @@
 
 #include <gtest/gtest.h>
 
-#include "sim_device.h"
+#include "fault_checks.h"
+
+using namespace fault_checks;
 
 namespace {
-
-const char kCsdfAnswer[] = "\r\n+CSDF: 1,1\n\r\n\r\nOK\r\n";
 
 // True when tolkd holds a descriptor on the device side of the serial link.
 bool tolkdHoldsSerialPort(const SimDevice &d) {
     char target[PATH_MAX];
     ssize_t n = readlink((d.root() + "/dev/ttyGS0").c_str(), target, sizeof target - 1);
-    if (n <= 0) return false;
-    target[n] = '\0';
-    std::string fdDir = "/proc/" + std::to_string(d.tolkdPid()) + "/fd";
-    DIR *dir = opendir(fdDir.c_str());
-    if (!dir) return false;
-    bool found = false;
-    while (struct dirent *e = readdir(dir)) {
-        char link[PATH_MAX];
-        ssize_t m = readlink((fdDir + "/" + e->d_name).c_str(), link, sizeof link - 1);
-        if (m > 0) {
-            link[m] = '\0';
-            if (std::string(link) == target) found = true;
-        }
-    }
-    closedir(dir);
-    return found;
+    return n > 0 && tolkdFdList(d).find("->" + std::string(target, static_cast<size_t>(n)) + " ") != std::string::npos;
 }
 
 TEST(Startup, EngineeringBootModeStopsTheDaemonWithStatusZero) {
@@ -61,6 +46,7 @@ TEST(Startup, OtherBootModesServe) {
         {{"--boot-mode", ""}, "Boot mode = 0"},
         {{"--boot-mode", "x5"}, "Boot mode = 0"},
         {{"--boot-mode", "4"}, "Boot mode = 4"},
+        {{"--boot-mode", "\xff\xfe"}, "tolkd-daemon start!!!"},
         {{"--no-boot-mode"}, "Boot mode = -1"},
     };
     for (const Case &c : cases) {
@@ -70,10 +56,10 @@ TEST(Startup, OtherBootModesServe) {
         EXPECT_NE(std::string::npos, d.log().find(c.logLine)) << d.log();
         EXPECT_NE(std::string::npos, d.log().find("tolkd-daemon start!!!"));
         EXPECT_EQ(kCsdfAnswer, d.at("AT+CSDF?", true)) << "adb link";
+        if (c.args[0] == "--no-boot-mode") {
+            EXPECT_NE(std::string::npos, d.log().find("Failed to open boot mode file /sys/class/BOOT/BOOT/boot/boot_mode"));
+        }
     }
-    SimDevice missing({"--no-boot-mode"});
-    EXPECT_NE(std::string::npos,
-              missing.log().find("Failed to open boot mode file /sys/class/BOOT/BOOT/boot/boot_mode"));
 }
 
 TEST(Startup, AtmModeServesTheAdbLinkOnly) {
@@ -110,22 +96,22 @@ TEST(Startup, AtmModeWithoutControlSocketStillRuns) {
 }
 
 TEST(Startup, PctModeFollowsTheOperatorAtEveryStart) {
-    {
-        SimDevice d;
-        ASSERT_TRUE(d.started()) << d.upOutput();
-        EXPECT_EQ("1", d.getprop("persist.service.pct.mode"));
-    }
-    {
-        SimDevice d({"--prop", "persist.operator.optr=OP07"});
-        ASSERT_TRUE(d.started()) << d.upOutput();
-        EXPECT_EQ("0", d.getprop("persist.service.pct.mode"));
-        EXPECT_NE(std::string::npos, d.log().find("operator is OP07 and set PCT mode 0 for AT&T"));
-    }
-    {
+    struct Case {
+        std::vector<std::string> args;
+        const char *pct;
+    } cases[] = {
+        {{}, "1"},
+        {{"--prop", "persist.operator.optr=OP07"}, "0"},
         // A stale "0" of an earlier operator is overwritten; the test is exact.
-        SimDevice d({"--prop", "persist.operator.optr=OP07X", "--prop", "persist.service.pct.mode=0"});
+        {{"--prop", "persist.operator.optr=OP07X", "--prop", "persist.service.pct.mode=0"}, "1"},
+    };
+    for (const Case &c : cases) {
+        SimDevice d(c.args);
         ASSERT_TRUE(d.started()) << d.upOutput();
-        EXPECT_EQ("1", d.getprop("persist.service.pct.mode"));
+        EXPECT_EQ(c.pct, d.getprop("persist.service.pct.mode"));
+        if (c.args.size() == 2) {
+            EXPECT_NE(std::string::npos, d.log().find("operator is OP07 and set PCT mode 0 for AT&T"));
+        }
     }
 }
 

@@ -279,12 +279,3 @@ std::string readUntil(int fd, const std::string &needle, int timeoutMs) {
 }
 
 std::string visible(const std::string &bytes) { return sim::visibleBytes(bytes); }
-
-bool SimDevice::waitForLog(const std::string &needle, int timeoutMs) const {
-    long long deadline = sim::nowMs() + timeoutMs;
-    for (;;) {
-        if (log().find(needle) != std::string::npos) return true;
-        if (sim::nowMs() >= deadline) return false;
-        sim::sleepMs(10);
-    }
-}

@@ -44,8 +44,6 @@ public:
     bool fileExists(const std::string &devicePath) const;
     // The daemon's log so far.
     std::string log() const;
-    // Waits until the daemon's log contains needle; false on timeout.
-    bool waitForLog(const std::string &needle, int timeoutMs = 5000) const;
     // A value from <root>/sim.env (TOLKD_PID, TOLK_HOST_TTY, TOLK_ADB_SOCKET, TOLKD_LOG...).
     std::string env(const std::string &key) const;
     pid_t tolkdPid() const;
