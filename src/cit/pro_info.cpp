@@ -61,31 +61,37 @@ int getFlag(int index) {
     return record[index];
 }
 
+// Both opens of setFlag: a record of any other shape is neither read nor written.
+static bool openRecordForSet(F_ID *fid) {
+    int recSize = 0;
+    int recNum = 0;
+    *fid = NVM_GetFileDesc(PRODUCT_INFO_FILE_NO, &recSize, &recNum, false);
+    if (fid->iFileDesc < 0) {
+        LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "NVM_GetFileDesc is fails errno %d\n", errno);
+        return false;
+    }
+    if (recNum != 1) {
+        LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Unexpected record num %d", recNum);
+        NVM_CloseFileDesc(*fid);
+        return false;
+    }
+    if (recSize != PRODUCT_INFO_SIZE) {
+        LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Unexpected record size %d PRODUCT_INFO %d", recSize,
+                PRODUCT_INFO_SIZE);
+        NVM_CloseFileDesc(*fid);
+        return false;
+    }
+    return true;
+}
+
 void setFlag(int index, unsigned char value) {
     if (!validIndex(index)) {
         LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Invalid flag index %d", index);
         return;
     }
 
-    int recSize = 0;
-    int recNum = 0;
-    F_ID fid = NVM_GetFileDesc(PRODUCT_INFO_FILE_NO, &recSize, &recNum, false);
-    if (fid.iFileDesc < 0) {
-        LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "NVM_GetFileDesc is fails errno %d\n", errno);
-        return;
-    }
-    if (recNum != 1) {
-        LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Unexpected record num %d", recNum);
-        NVM_CloseFileDesc(fid);
-        return;
-    }
-    if (recSize != PRODUCT_INFO_SIZE) {
-        LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Unexpected record size %d PRODUCT_INFO %d", recSize,
-                PRODUCT_INFO_SIZE);
-        NVM_CloseFileDesc(fid);
-        return;
-    }
-
+    F_ID fid;
+    if (!openRecordForSet(&fid)) return;
     unsigned char record[PRODUCT_INFO_SIZE];
     if (!readRecord(fid, record)) {
         LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Read NVRAM fails errno %d\n", errno);
@@ -95,28 +101,11 @@ void setFlag(int index, unsigned char value) {
     NVM_CloseFileDesc(fid);
     record[index] = value;
 
-    // The record goes back through a second open. Its shape is checked again so
-    // that exactly the bytes just read are written, never more than the record
-    // holds; a failure is logged, since nobody else would notice it.
-    recSize = 0;
-    recNum = 0;
-    fid = NVM_GetFileDesc(PRODUCT_INFO_FILE_NO, &recSize, &recNum, false);
-    if (fid.iFileDesc < 0) {
-        LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "NVM_GetFileDesc is fails errno %d\n", errno);
-        return;
-    }
-    if (recNum != 1) {
-        LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Unexpected record num %d", recNum);
-        NVM_CloseFileDesc(fid);
-        return;
-    }
-    if (recSize != PRODUCT_INFO_SIZE) {
-        LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Unexpected record size %d PRODUCT_INFO %d", recSize,
-                PRODUCT_INFO_SIZE);
-        NVM_CloseFileDesc(fid);
-        return;
-    }
-    ssize_t put = write(fid.iFileDesc, record, (size_t)recSize * (size_t)recNum);
+    // The record goes back through a second open, whose shape is checked again so
+    // that exactly the bytes just read are written; a failure is logged, since
+    // nobody else would notice it.
+    if (!openRecordForSet(&fid)) return;
+    ssize_t put = write(fid.iFileDesc, record, sizeof(record));
     if (put != PRODUCT_INFO_SIZE) {
         LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Write NVRAM fails errno %d\n", errno);
     }
