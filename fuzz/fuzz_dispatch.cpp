@@ -37,8 +37,7 @@ void resetHandlerState() {
     wifiEnableState = -1;
     wifiBand = -1;
     wifiFrequency = wifiDataRate = wifiTxPower = 0;
-    memset(&gMmiCmdSeq, 0, sizeof(gMmiCmdSeq));
-    for (int &s : gMmiCmdSeq.seq) s = -1;
+    mmiCmdSeqReset();
 }
 
 // Property writes are files under the root: only rewrite them when they change.

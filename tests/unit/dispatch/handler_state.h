@@ -24,8 +24,7 @@ inline void resetHandlerState() {
     wifiEnableState = -1;
     wifiBand = -1;
     wifiFrequency = wifiDataRate = wifiTxPower = 0;
-    std::memset(&gMmiCmdSeq, 0, sizeof(gMmiCmdSeq));
-    for (int &s : gMmiCmdSeq.seq) s = -1;
+    mmiCmdSeqReset();
 }
 
 inline std::string prop(const char *name, const char *def = "(unset)") {
