@@ -1,5 +1,5 @@
-// `tolk-sim up` and the supervisor it leaves behind: the simulated device around
-// one tolkd process.
+// `tolk-sim up` and `down`: the simulated device around one tolkd process. The
+// supervisor that `up` leaves behind is in sim_supervisor.h.
 #ifndef TOLK_SIM_DEVICE_H
 #define TOLK_SIM_DEVICE_H
 

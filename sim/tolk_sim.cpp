@@ -17,6 +17,7 @@
 #include "peers.h"
 #include "sim_client.h"
 #include "sim_device.h"
+#include "sim_host_tools.h"
 #include "sim_text.h"
 #include "sim_util.h"
 
@@ -78,6 +79,13 @@ const char kUsage[] =
     "  stop|start --root DIR NAME  stop or restart a peer (radio generic audio cit)\n"
     "  urc --root DIR [--slot N] TEXT  unsolicited modem output from SIM slot N\n"
     "                            (default 1; escapes as for at)\n"
+    "  host --root DIR -- CMD [ARGS...]  run a host program with the host port\n"
+    "                            behaving as a USB ACM port: DTR and RTS can be set\n"
+    "                            and read, DSR, CTS and CD follow the cable\n"
+    "  forward --root DIR [--background] tcp:PORT  relay each connection to\n"
+    "                            127.0.0.1:PORT to the adb control socket, as\n"
+    "                            `adb forward` does (tcp:0 picks and prints a port);\n"
+    "                            runs until SIGINT or SIGTERM\n"
     "  peer NAME --root DIR [ARGS]  run one peer in the foreground (the supervisor\n"
     "                            does this)\n"
     "\n"
@@ -262,6 +270,25 @@ int dispatch(const std::vector<std::string> &argv) {
         return run_cit_peer(a.root, a.rest);
     }
 
+    if (cmd == "host") {
+        // Only the options before "--" are tolk-sim's: the command may have a
+        // --root of its own.
+        Args a;
+        size_t i = 2;
+        for (; i < argv.size() && argv[i] != "--"; i++) {
+            if (argv[i] == "--root" && i + 1 < argv.size()) {
+                a.root = argv[++i];
+            } else {
+                fprintf(stderr, "tolk-sim host: unexpected '%s' (tolk-sim host --root DIR -- CMD ARGS...)\n",
+                        argv[i].c_str());
+                return 2;
+            }
+        }
+        if (!resolveRoot(cmd, &a.root)) return 2;
+        std::vector<std::string> command(argv.begin() + static_cast<long>(std::min(i + 1, argv.size())), argv.end());
+        return sim::cmdHost(a.root, command);
+    }
+
     Args a;
     if (!splitRoot(argv, 2, &a)) {
         fprintf(stderr, "tolk-sim %s: --root needs a folder\n", cmd.c_str());
@@ -276,6 +303,7 @@ int dispatch(const std::vector<std::string> &argv) {
     }
     if (!resolveRoot(cmd, &a.root)) return 2;
     if (cmd == "at") return cmdAt(a);
+    if (cmd == "forward") return sim::cmdForward(a.root, a.rest);
     if (cmd == "console") {
         bool adb = std::find(a.rest.begin(), a.rest.end(), "--adb") != a.rest.end();
         return sim::cmdConsole(a.root, adb);

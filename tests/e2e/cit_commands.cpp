@@ -97,7 +97,6 @@ TEST(CitCommands, ResultFileStartAndShutDown) {
     SimDevice dev;
     ASSERT_TRUE(dev.started()) << dev.upOutput();
     EXPECT_EQ("\r\nx0000000\r\nOK\r\n", cit(dev, "AT*CIT_GACITF"));
-    dev.writeFile("/data/prod/.keep", "");
     EXPECT_EQ("\r\nOK\r\n", cit(dev, "AT*CIT_WCITF"));
     EXPECT_EQ("x0000001", dev.readFile("/data/prod/citf"));
     EXPECT_EQ("\r\nx0000001\r\nOK\r\n", cit(dev, "AT*CIT_GACITF"));
