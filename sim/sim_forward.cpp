@@ -189,9 +189,10 @@ int cmdForward(const std::string &root, const std::vector<std::string> &args) {
             return 1;
         }
         if (pid > 0) {
+            // The pid on stdout, for a script's `kill $(tolk-sim forward ...)`.
             if (port == 0) printf("%d\n", bound);
-            fprintf(stderr, "forwarding 127.0.0.1:%d to %s (pid %d; kill %d stops it)\n", bound, adb.c_str(), pid,
-                    pid);
+            printf("%d\n", pid);
+            fprintf(stderr, "forwarding 127.0.0.1:%d to %s (kill %d stops it)\n", bound, adb.c_str(), pid);
             return 0;
         }
         setsid();

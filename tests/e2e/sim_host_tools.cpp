@@ -204,12 +204,9 @@ TEST(SimHostTools, ForwarderRelaysTheAdbLinkOverLoopbackTcp) {
     SimDevice d;
     ASSERT_TRUE(d.started()) << d.upOutput();
     std::string out;
-    ASSERT_EQ(0, runSim({"forward", "--root", d.root(), "--background", "tcp:0"}, &out, true)) << out;
-    size_t at = out.find("pid "), addr = out.find("127.0.0.1:");
-    ASSERT_TRUE(at != std::string::npos && addr != std::string::npos) << out;
-    pid_t pid = atoi(out.c_str() + at + 4);
-    int port = atoi(out.c_str() + addr + 10);
-    ASSERT_GT(port, 0) << out;
+    ASSERT_EQ(0, runSim({"forward", "--root", d.root(), "--background", "tcp:0"}, &out)) << out;
+    int port = 0, pid = 0;
+    ASSERT_EQ(2, sscanf(out.c_str(), "%d\n%d\n", &port, &pid)) << "the port picked, then the pid: " << out;
 
     const std::string direct = d.at("AT*CIT_GACITF", true);
     int first = tcpConnect(port);
