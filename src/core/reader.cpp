@@ -4,12 +4,14 @@
 #include "core/reader.h"
 
 #include <errno.h>
+#include <poll.h>
 #include <stdlib.h>
 #include <string.h>
 #include <sys/select.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include "core/line_edit.h"
 #include "core/sms_merge.h"
 #include "core/tolkd_log.h"
 #include "dispatch/dispatcher.h"
@@ -29,8 +31,13 @@ int tolk_conn_mode = 1;
 #define MMITEST_FIX_OFFSET 12
 #define MMITEST_MAX_EXTRA_READS 5
 #define MMITEST_SCRATCH_SIZE 101
+// How long each extra read of the repair waits for the next piece.
+#define MMITEST_PIECE_WAIT_MS 50
 
 #define SERIAL_REOPEN_ATTEMPTS 3
+// Pause after a failed accept while nothing else is ready, so that a listener that
+// keeps failing (descriptor table full) does not spin the main loop.
+#define ACCEPT_RETRY_PAUSE_USEC (10 * 1000)
 
 static char lineBuf[DATA_BUF_SIZE];
 static char adbBuf[DATA_BUF_SIZE];
@@ -102,11 +109,29 @@ static int readFromHost(SerialDevice *dev, int slot, char *buf) {
     }
 }
 
+// Waits at most MMITEST_PIECE_WAIT_MS for more bytes on fd. The pieces of a frame the
+// link split arrive within a millisecond or two of each other; a frame whose rest
+// never comes must not hold up the other links.
+static bool pieceArrives(int fd) {
+    struct pollfd p;
+    p.fd = fd;
+    p.events = POLLIN;
+    p.revents = 0;
+    int rc;
+    do {
+        rc = poll(&p, 1, MMITEST_PIECE_WAIT_MS);
+    } while (rc < 0 && errno == EINTR);
+    return rc > 0 && (p.revents & POLLIN) != 0;
+}
+
 // Puts back the pieces of a damaged "at^mmitest=" frame. Only a frame shorter than
 // 51 bytes is repaired: a longer line cannot be a frame that lost bytes, and waiting
 // for more would swallow the host's next command line. Extra reads ask only for the
-// bytes still missing, so the frame never grows past 51 bytes.
-static int repairMmitestFrame(int fd, char *buf, int n) {
+// bytes still missing, so the frame never grows past 51 bytes, and each waits a
+// bounded time. *ownLen is set to the bytes that came with the first read (the two
+// put back included): whatever follows them was read from later input.
+static int repairMmitestFrame(int fd, char *buf, int n, int *ownLen) {
+    *ownLen = n;
     if (n == MMITEST_FRAME_LEN || strncmp(buf, MMITEST_FRAME_PREFIX, MMITEST_FRAME_PREFIX_LEN) != 0) return n;
 
     for (int i = 0; i < 16; i++) LOGE("p_buffer[%d]=0x%x", i, (unsigned char)buf[i]);
@@ -121,9 +146,11 @@ static int repairMmitestFrame(int fd, char *buf, int n) {
             buf[MMITEST_FIX_OFFSET + 1] = (char)0xA8;
             memcpy(buf + MMITEST_FIX_OFFSET + 2, scratch, tail);
             n += 2;
+            *ownLen = n;
         }
         for (int tries = 0; n < MMITEST_FRAME_LEN && tries < MMITEST_MAX_EXTRA_READS; tries++) {
             LOGD("to read the data for ffa8 & ff99");
+            if (!pieceArrives(fd)) break;
             memset(scratch, 0, sizeof(scratch));
             ssize_t got = read(fd, scratch, MMITEST_FRAME_LEN - n);
             LOGD("read %d bytes  for ffa8 & ff99", n);
@@ -141,20 +168,33 @@ static int repairMmitestFrame(int fd, char *buf, int n) {
     return n;
 }
 
+// Moves a completed adb line of len bytes from adbLine to lineBuf and starts the
+// next line with carry bytes of src.
+static int completeAdbLine(int len, const char *src, int carry) {
+    LOGD(".AT command read done.");
+    memcpy(lineBuf, adbLine, len);
+    lineBuf[len] = '\0';
+    discardAdbLine();
+    if (carry > 0) {
+        memcpy(adbLine, src, carry);
+        adbLineLen = carry;
+    }
+    return len;
+}
+
 // Adds the new adb bytes to the line being assembled. Returns the length of the
 // completed line (now in lineBuf), or 0 when the line needs more bytes. A line ends
-// at CR or at 6144 bytes; whatever follows in the same packet is dropped.
-static int assembleAdbLine(const char *bytes, int n) {
+// at CR or at 6144 bytes. The rest of the same packet is dropped (one line per
+// packet), but bytes from ownLen on were read from later packets by the frame
+// repair: they belong to the host's next line and stay for it.
+static int assembleAdbLine(const char *bytes, int n, int ownLen) {
     for (int i = 0; i < n; i++) {
         int off = adbLineLen + i;
         adbLine[off] = bytes[i];
         if (bytes[i] == '\r' || off > MAX_DATA_LEN - 2) {
-            int len = off + 1;
-            LOGD(".AT command read done.");
-            memcpy(lineBuf, adbLine, len);
-            lineBuf[len] = '\0';
-            discardAdbLine();
-            return len;
+            int next = i + 1 > ownLen ? i + 1 : ownLen;
+            int carry = n > next ? n - next : 0;
+            return completeAdbLine(off + 1, bytes + next, carry);
         }
     }
     LOGD(".AT command read more.");
@@ -163,8 +203,65 @@ static int assembleAdbLine(const char *bytes, int n) {
     return 0;
 }
 
+// A line that the frame repair carried over may already be complete; it is served
+// before the reader waits for more input. Returns its length, or 0.
+static int takeCarriedAdbLine(void) {
+    const char *cr = (const char *)memchr(adbLine, '\r', (size_t)adbLineLen);
+    if (cr == NULL) return 0;
+    int len = (int)(cr - adbLine) + 1;
+    char rest[MMITEST_FRAME_LEN];
+    int carry = adbLineLen - len;
+    if (carry > (int)sizeof(rest)) carry = (int)sizeof(rest);
+    memcpy(rest, adbLine + len, carry);
+    return completeAdbLine(len, rest, carry);
+}
+
 static bool beginsWithAt(const char *line, int n) {
     return n >= 3 && (line[0] == 'A' || line[0] == 'a') && (line[1] == 'T' || line[1] == 't');
+}
+
+// One adb connection at a time: a new one replaces the old, which is closed so that
+// its descriptor does not leak. Only a successful accept replaces it: a client that
+// went away before it was accepted, or a full descriptor table, must not cost the
+// connected station its connection and its half-typed line. Returns 0 or -1.
+static int acceptAdbConnection(SerialDevice *dev) {
+    int fd = adb_socket_accept(dev->fd[DEVICE_ADB_LISTEN]);
+    if (fd < 0) return -1;
+    if (fd >= FD_SETSIZE) {
+        LOGE("accepted fd %d is beyond select range, dropped", fd);
+        close(fd);
+        return -1;
+    }
+    closeAdbConnection(dev);
+    dev->fd[DEVICE_ADB] = fd;
+    // The new connection is read once select reports it readable: a host that
+    // connects and says nothing must not hold up the serial port and the modem.
+    return 0;
+}
+
+// Turns a complete host line of n bytes in lineBuf into the command line in cmdBuf.
+// Returns cmdBuf, or NULL when the line is no command and is dropped.
+static char *acceptLine(SerialDevice *dev, int n) {
+    LOGD("state %d with %d:%d", dev->state, 0, lineBuf[0]);
+
+    // SMS body text; a lone LF is only the tail of the command line's CR LF.
+    if (isMsgCmdInput && !(n == 1 && lineBuf[0] == '\n')) return handleMsgTextLine(dev, lineBuf, n);
+
+    int readCurr = audio_command_hdlr(lineBuf);
+    if (readCurr <= 0) {
+        n = applyBackspaces(lineBuf, n);
+        if (!beginsWithAt(lineBuf, n)) return NULL;
+        readCurr = 2;
+    }
+
+    dev->state = 3;
+    dev->cmdLen = n;
+    LOGD("the readCurr is %d & the total size is %d", readCurr, n);
+    memcpy(dev->cmdBuf, lineBuf, n);
+    dev->cmdBuf[n] = '\0';
+    // Device-maker audio commands go out byte for byte, delimiter included.
+    if (belvo_audio_command_hdlr(lineBuf) == 0) dev->cmdBuf[n - 1] = '\0';
+    return dev->cmdBuf;
 }
 
 char *readline(SerialDevice *dev) {
@@ -181,6 +278,17 @@ char *readline(SerialDevice *dev) {
         }
         memset(lineBuf, 0, sizeof(lineBuf));
         dev->state = 0;
+
+        if (dev->fd[DEVICE_ADB] >= 0 && adbLineLen > 0) {
+            int n = takeCarriedAdbLine();
+            if (n > 0) {
+                tolk_conn_mode = CONN_MODE_ADB;
+                dev->currDevice = DEVICE_ADB;
+                char *line = acceptLine(dev, n);
+                if (line != NULL) return line;
+                continue;
+            }
+        }
 
         fd_set readSet;
         FD_ZERO(&readSet);
@@ -228,28 +336,23 @@ char *readline(SerialDevice *dev) {
         while (slot < DEVICE_COUNT && !isReady(dev->fd[slot], &readSet)) slot++;
         if (slot == DEVICE_COUNT) continue;
 
+        if (slot == DEVICE_ADB_LISTEN) {
+            if (acceptAdbConnection(dev) == 0) continue;
+            // The listener failed; a live connection that is ready is still served,
+            // and a listener that keeps failing does not spin the loop.
+            if (!isReady(dev->fd[DEVICE_ADB], &readSet)) {
+                usleep(ACCEPT_RETRY_PAUSE_USEC);
+                continue;
+            }
+            slot = DEVICE_ADB;
+        }
+
         LOGD("Read data from USB:%d:%d", slot, dev->fd[slot]);
         char *buf;
         if (slot == DEVICE_SERIAL) {
             buf = lineBuf;
             tolk_conn_mode = CONN_MODE_VCOM;
         } else {
-            if (slot == DEVICE_ADB_LISTEN) {
-                // One adb connection at a time: a new one replaces the old, which is
-                // closed so that its descriptor does not leak.
-                closeAdbConnection(dev);
-                int fd = adb_socket_accept(dev->fd[DEVICE_ADB_LISTEN]);
-                if (fd >= FD_SETSIZE) {
-                    LOGE("accepted fd %d is beyond select range, dropped", fd);
-                    close(fd);
-                    fd = -1;
-                }
-                dev->fd[DEVICE_ADB] = fd;
-                // The new connection is read once select reports it readable: a
-                // host that connects and says nothing must not hold up the serial
-                // port and the modem answers.
-                continue;
-            }
             buf = adbBuf;
             tolk_conn_mode = CONN_MODE_ADB;
         }
@@ -262,35 +365,17 @@ char *readline(SerialDevice *dev) {
             LOGD("VCOM mode, sleep 0.01s");
             usleep(10 * 1000);
         }
-        n = repairMmitestFrame(dev->fd[slot], buf, n);
+        int ownLen = n;
+        n = repairMmitestFrame(dev->fd[slot], buf, n, &ownLen);
 
         dev->currDevice = slot;
         LOGD("tolk_conn_mode = [%d], [%x]", tolk_conn_mode, (unsigned char)buf[0]);
 
         if (tolk_conn_mode == CONN_MODE_ADB) {
-            n = assembleAdbLine(adbBuf, n);
+            n = assembleAdbLine(adbBuf, n, ownLen);
             if (n == 0) continue;
         }
-
-        LOGD("state %d with %d:%d", dev->state, 0, lineBuf[0]);
-
-        // SMS body text; a lone LF is only the tail of the command line's CR LF.
-        if (isMsgCmdInput && !(n == 1 && lineBuf[0] == '\n')) return handleMsgTextLine(dev, lineBuf, n);
-
-        int readCurr = audio_command_hdlr(lineBuf);
-        if (readCurr <= 0) {
-            n = applyBackspacesCounted(lineBuf, n);
-            if (!beginsWithAt(lineBuf, n)) continue;
-            readCurr = 2;
-        }
-
-        dev->state = 3;
-        dev->cmdLen = n;
-        LOGD("the readCurr is %d & the total size is %d", readCurr, n);
-        memcpy(dev->cmdBuf, lineBuf, n);
-        dev->cmdBuf[n] = '\0';
-        // Device-maker audio commands go out byte for byte, delimiter included.
-        if (belvo_audio_command_hdlr(lineBuf) == 0) dev->cmdBuf[n - 1] = '\0';
-        return dev->cmdBuf;
+        char *line = acceptLine(dev, n);
+        if (line != NULL) return line;
     }
 }

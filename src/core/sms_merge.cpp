@@ -10,6 +10,7 @@
 #include <cutils/properties.h>
 
 #include "attok/at_tok.h"
+#include "core/line_edit.h"
 #include "core/reader.h"
 #include "core/tolkd_log.h"
 #include "dispatch/dispatcher.h"
@@ -42,31 +43,9 @@ static const char kPrompt[] = "\r\n> ";
 
 #define CTRL_Z 0x1A
 #define ESC 0x1B
-#define BACKSPACE 0x08
 
 // Scratch copy for the tokenizer, which writes into the line it reads.
 static char tokBuf[DATA_BUF_SIZE];
-
-int applyBackspacesCounted(char *line, int n) {
-    int textLen = (int)strnlen(line, n);
-    int kept = 0;
-    for (int i = 0; i < textLen; i++) {
-        if (line[i] == BACKSPACE) {
-            if (kept > 0) kept--;
-        } else {
-            line[kept++] = line[i];
-        }
-    }
-    int removed = textLen - kept;
-    if (removed == 0) return n;
-    // Bytes after an embedded NUL (raw frames) stay part of the line.
-    memmove(line + kept, line + textLen, n - textLen);
-    int newLen = n - removed;
-    memset(line + newLen, 0, removed + 1);
-    return newLen;
-}
-
-void applyBackspaces(char *line) { applyBackspacesCounted(line, (int)strlen(line)); }
 
 int isMsgCmd(const char *line) {
     // The name ends at the first "=" that carries parameters; "=?" and a bare "="
@@ -152,7 +131,7 @@ char *handleMsgTextLine(SerialDevice *dev, char *lineBuf, int n) {
         return dev->cmdBuf;
     }
 
-    n = applyBackspacesCounted(lineBuf, n);
+    n = applyBackspaces(lineBuf, n);
     LOGD("isNeedMergeMsgCmdInput, text=%s", lineBuf);
 
     char *buf = dev->cmdBuf;

@@ -16,11 +16,5 @@ int startMergeMsgCmdInputIfNeed(SerialDevice *dev, const char *line);
 char *handleMsgTextLine(SerialDevice *dev, char *lineBuf, int n);
 // Routing side: prompt for more text, or send the text line / merged command.
 void routeMsgTextLine(SerialDevice *dev);
-// Backspace editing shared with the command filter: BS removes the last byte kept.
-void applyBackspaces(char *line);
-// The same on a line of n bytes that may hold NUL bytes: the text up to the first NUL
-// is edited, the bytes after it move down to close the gap, and the new length is
-// returned. line must have room for n + 1 bytes.
-int applyBackspacesCounted(char *line, int n);
 
 #endif

@@ -91,9 +91,3 @@ TEST_F(SmsMergeTest, MergedCommandNeverOutgrowsTheBuffer) {
     // A held command with no room for suffix and closing is relayed instead.
     EXPECT_FALSE(startMerge("AT+CMGS=" + std::string(6136, '1')));
 }
-
-TEST(BackspaceTest, BytesAfterAnEmbeddedNulStayPartOfTheLine) {
-    char line[16] = {'A', 'X', '\b', 'T', '\0', 'z', '\n'};
-    EXPECT_EQ(5, applyBackspacesCounted(line, 7));
-    EXPECT_EQ(std::string("AT\0z\n\0", 6), std::string(line, 6));
-}
