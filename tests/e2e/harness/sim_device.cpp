@@ -64,7 +64,7 @@ int runSim(const std::vector<std::string> &args, std::string *out, bool errToo) 
     return 128 + (WIFSIGNALED(status) ? WTERMSIG(status) : 0);
 }
 
-SimDevice::SimDevice(const std::vector<std::string> &upArgs) {
+SimDevice::SimDevice(const std::vector<std::string> &upArgs, const std::function<void(SimDevice &)> &beforeUp) {
     // Short: the sockets under the root must fit into 108 bytes.
     char tmpl[] = "/tmp/tsXXXXXX";
     if (!mkdtemp(tmpl)) {
@@ -72,6 +72,7 @@ SimDevice::SimDevice(const std::vector<std::string> &upArgs) {
         return;
     }
     root_ = tmpl;
+    if (beforeUp) beforeUp(*this);
     // TOLK_E2E_TOLKD runs the daemon through something else, e.g. a valgrind wrapper.
     const char *tolkd = getenv("TOLK_E2E_TOLKD");
     std::vector<std::string> args = {"up", "--root", root_, "--tolkd", tolkd && *tolkd ? tolkd : TOLKD_BINARY};

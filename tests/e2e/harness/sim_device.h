@@ -5,6 +5,7 @@
 
 #include <sys/types.h>
 
+#include <functional>
 #include <string>
 #include <vector>
 
@@ -16,7 +17,9 @@ class SimDevice {
 public:
     // `tolk-sim up --root <fresh temporary folder> <upArgs...>`. started() tells
     // whether tolkd is serving; upStatus()/upOutput() give what up reported.
-    explicit SimDevice(const std::vector<std::string> &upArgs = {});
+    // beforeUp may put files into the root (scripts, NVRAM content) before up.
+    explicit SimDevice(const std::vector<std::string> &upArgs = {},
+                       const std::function<void(SimDevice &)> &beforeUp = nullptr);
     // `tolk-sim down`, then the root folder is removed.
     ~SimDevice();
     SimDevice(const SimDevice &) = delete;
