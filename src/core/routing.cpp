@@ -48,6 +48,14 @@ void readerLoop(SerialDevice *dev) {
     }
 }
 
+// "AT" alone, or followed by nothing but line-end characters: the liveness probe a
+// production build lets through. On adb a line ends at CR, so an LF inside it is no
+// end: "AT\n+CFUN=0" is a command and must not pass as a probe.
+static bool isBareAt(const char *line) {
+    if (strncmp(line, "AT", 2) != 0) return false;
+    return line[2 + strspn(line + 2, "\r\n")] == '\0';
+}
+
 // On production builds the modem takes nothing but a bare "AT" unless the user-mode
 // switch has been turned on.
 static bool modemAccessAllowed(const char *line) {
@@ -59,7 +67,7 @@ static bool modemAccessAllowed(const char *line) {
     property_get("persist.service.tolk.usermode", userMode, "0");
     LOGI("Build type :%s, tolk_usermode:%s", buildType, userMode);
     if (strcmp(buildType, "eng") == 0 || strcmp(userMode, "1") == 0) return true;
-    return strcmp(line, "AT") == 0 || strncmp(line, "AT\r", 3) == 0 || strncmp(line, "AT\n", 3) == 0;
+    return isBareAt(line);
 }
 
 static void routeToModem(SerialDevice *dev, const char *line) {
