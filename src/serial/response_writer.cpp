@@ -47,7 +47,7 @@ bool isFinalResult(const char *data, int len) {
     return false;
 }
 
-static bool isAudioResponse(const char *data, int len) {
+bool isAudioResponse(const char *data, int len) {
     return startsWith(data, len, "AUD") || startsWith(data, len, "aud") || startsWith(data, len, "MM") ||
            startsWith(data, len, "mm");
 }
@@ -65,6 +65,17 @@ void Response2Numeric(const char *in, char *out) {
     const size_t n = strlen(in);
     memcpy(out, in, n);
     out[n] = '\0';
+}
+
+// One write of the finished answer; what does not go out is lost (the reader finds
+// and reopens a broken serial link).
+static int writeToHost(int fd, const char *out, int outLen) {
+    LOGD("length=%d", outLen);
+    const ssize_t written = write(fd, out, (size_t)outLen);
+    if (written != outLen) {
+        LOGW("Couldn't write all data to the serial port. Wrote only %d bytes with %d", (int)written, errno);
+    }
+    return (int)written;
 }
 
 int writeDataToSerial(const char *data, int len) {
@@ -85,55 +96,55 @@ int writeDataToSerial(const char *data, int len) {
         return -1;
     }
 
-    char body[WRITER_MAX_LEN + 1];
-    char converted[WRITER_MAX_LEN + 1];
-    char framed[WRITER_MAX_LEN + 8];
-    const char *out;
-    int outLen;
-
     if (isAudioResponse(data, len)) {
         LOGI("audio type response");
-        out = data;
-        outLen = len;
+        return writeToHost(fd, data, len);
+    }
+
+    LOGD("Not audio");
+    const bool head = len >= 2 && data[0] == '\r' && data[1] == '\n';
+    const bool tail = len >= 2 && data[len - 2] == '\r' && data[len - 1] == '\n';
+    const char *start = data;
+    int bodyLen = len;
+    if (head && tail) {
+        start = data + 2;
+        bodyLen = len >= 4 ? len - 4 : 0;
+        LOGD("remove head and tail");
+    } else if (head) {
+        start = data + 2;
+        bodyLen = len - 2;
+        LOGD("remove head");
+    } else if (tail) {
+        bodyLen = len - 2;
+        LOGD("remove tail");
     } else {
-        LOGD("Not audio");
-        const bool head = len >= 2 && data[0] == '\r' && data[1] == '\n';
-        const bool tail = len >= 2 && data[len - 2] == '\r' && data[len - 1] == '\n';
-        const char *start = data;
-        int bodyLen = len;
-        if (head && tail) {
-            start = data + 2;
-            bodyLen = len >= 4 ? len - 4 : 0;
-            LOGD("remove head and tail");
-        } else if (head) {
-            start = data + 2;
-            bodyLen = len - 2;
-            LOGD("remove head");
-        } else if (tail) {
-            bodyLen = len - 2;
-            LOGD("remove tail");
-        } else {
-            LOGD("No remove");
-        }
-        memcpy(body, start, (size_t)bodyLen);
-        body[bodyLen] = '\0';
-
-        const char *text = body;
-        if (gNumericMode) {
-            memset(converted, 0, sizeof(converted));
-            Response2Numeric(body, converted);
-            text = converted;
-        }
-        outLen = snprintf(framed, sizeof(framed), "\r\n%s\r\n", text);
-        out = framed;
+        LOGD("No remove");
     }
+    char body[WRITER_MAX_LEN + 1];
+    memcpy(body, start, (size_t)bodyLen);
+    body[bodyLen] = '\0';
 
-    LOGD("length=%d", outLen);
-    const ssize_t written = write(fd, out, (size_t)outLen);
-    if (written != outLen) {
-        LOGW("Couldn't write all data to the serial port. Wrote only %d bytes with %d", (int)written, errno);
+    const char *text = body;
+    char converted[WRITER_MAX_LEN + 1];
+    if (gNumericMode) {
+        memset(converted, 0, sizeof(converted));
+        Response2Numeric(body, converted);
+        text = converted;
     }
-    return (int)written;
+    char framed[WRITER_MAX_LEN + 8];
+    const int outLen = snprintf(framed, sizeof(framed), "\r\n%s\r\n", text);
+    return writeToHost(fd, framed, outLen);
+}
+
+int writeRawDataToSerial(const char *data, int len) {
+    if (data == NULL || len < 0) len = 0;
+    if (len > WRITER_MAX_LEN) len = WRITER_MAX_LEN;
+    const int fd = gSerialDevice.fd[currentOutputDevice()];
+    if (fd < 0) {
+        LOGE("Wrong fd with %d, currDevice = %d", fd, gSerialDevice.currDevice);
+        return -1;
+    }
+    return writeToHost(fd, data != NULL ? data : "", len);
 }
 
 int writeDataToserialByResponseType(int type) {

@@ -18,6 +18,12 @@ extern bool gNumericMode;
 
 // Writes data (len bytes, a counted NUL allowed) framed as "\r\n" body "\r\n".
 int writeDataToSerial(const char *data, int len);
+// Writes len bytes as they are, like an answer that begins with an audio prefix:
+// the later pieces of a raw audio answer go out the way its first piece did.
+int writeRawDataToSerial(const char *data, int len);
+// True when data begins with one of the audio prefixes ("AUD", "aud", "MM", "mm"),
+// whose answers the text writer passes through raw.
+bool isAudioResponse(const char *data, int len);
 // Writes the final result line for a handler's ResponseType.
 int writeDataToserialByResponseType(int type);
 // Replaces a body that is exactly a verbose final result by its V.250 digit.

@@ -54,7 +54,15 @@ static int waitReadable(int fd) {
     return 0;
 }
 
-int readDataFromTarget(int target, int *fd) {
+// How one received piece goes to the host. The first piece of an answer is judged
+// by its content (the text writer passes "AUD..."/"MM..." answers raw and frames the
+// rest); the later pieces of an answer longer than one receive go out the way the
+// first did, since a binary tail carries no prefix of its own.
+enum RelayForm { RELAY_BY_CONTENT, RELAY_RAW, RELAY_TEXT };
+
+// Receives one piece from a target and relays it. Returns the writer's result or the
+// result of closing; *used, when given, tells how the piece went out.
+static int relayFromTarget(int target, int *fd, RelayForm form, RelayForm *used) {
     if (fd == NULL) return -1;
     char buf[DATA_BUF_SIZE];
     LOGD("Read data from target:%d with fd:%d", target, *fd);
@@ -90,13 +98,20 @@ int readDataFromTarget(int target, int *fd) {
     int result = 0;
     if (target == BELVO_AUDIO_TYPE) {
         writeDataToSerialByAudioType(buf, (int)n);
+        form = RELAY_RAW;
+    } else if (form == RELAY_RAW) {
+        result = writeRawDataToSerial(buf, (int)n);
     } else {
         result = writeDataToSerial(buf, (int)n);
+        form = isAudioResponse(buf, (int)n) ? RELAY_RAW : RELAY_TEXT;
     }
+    if (used != NULL) *used = form;
 
     if (isFinalResult(buf, (int)n)) isMsgCmdInput = false;
     return result;
 }
+
+int readDataFromTarget(int target, int *fd) { return relayFromTarget(target, fd, RELAY_BY_CONTENT, NULL); }
 
 int readDataFromTargetWithResult(int target, int *fd, char *buf, int size) {
     if (fd == NULL || buf == NULL || size < 2) return -1;
@@ -180,13 +195,15 @@ void audioReaderLoop(int target) {
     }
     if (rc == 0) return;
     LOGD("Prepare read the data from audio driver");
-    readDataFromTarget(target, fd);
+    RelayForm form = RELAY_BY_CONTENT;
+    relayFromTarget(target, fd, RELAY_BY_CONTENT, &form);
     // An answer longer than one read is already waiting in full: relay the rest
-    // now, piece by piece, rather than leave it to be dropped before the next command.
+    // now, piece by piece and in the first piece's form, rather than leave it to be
+    // dropped before the next command.
     while (*fd >= 0) {
         struct pollfd p = {*fd, POLLIN, 0};
         if (poll(&p, 1, 0) != 1 || (p.revents & POLLIN) == 0) break;
-        readDataFromTarget(target, fd);
+        relayFromTarget(target, fd, form, &form);
     }
 }
 
@@ -202,17 +219,25 @@ int sendDataToGenericService(const char *data) {
 // An answer longer than one read leaves its tail on the link, where it would be
 // taken for the answer to the next command, and the one after. Nothing else is
 // ever waiting on an audio link before a command goes out (its answer is read
-// before the main loop goes on), so whatever is there now is stale.
-static void dropStaleAudioBytes(int fd) {
+// before the main loop goes on), so whatever is there now is stale. Returns false
+// when the link has ended (the service restarted): a command sent into it would
+// never be answered.
+static bool dropStaleAudioBytes(int fd) {
     char scratch[1024];
     unsigned long dropped = 0;
+    bool alive = true;
     for (;;) {
         ssize_t n = recv(fd, scratch, sizeof(scratch), MSG_DONTWAIT);
         if (n < 0 && errno == EINTR) continue;
-        if (n <= 0) break;
-        dropped += (unsigned long)n;
+        if (n > 0) {
+            dropped += (unsigned long)n;
+            continue;
+        }
+        alive = n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK);
+        break;
     }
     if (dropped > 0) LOGW("dropped %lu stale bytes from the audio link", dropped);
+    return alive;
 }
 
 int sendDataToAudio(const char *data, int len, int target) {
@@ -226,7 +251,15 @@ int sendDataToAudio(const char *data, int len, int target) {
         return 0;
     }
     if (data == NULL || len < 0) len = 0;
-    dropStaleAudioBytes(*fd);
+    if (!dropStaleAudioBytes(*fd)) {
+        LOGW("audio link %d has ended, connecting again", *fd);
+        closeLink(fd);
+        connectTarget(target);
+        if (*fd < 0) {
+            LOGE("invalid fd [%d].", *fd);
+            return 0;
+        }
+    }
     LOGD("sendDataToAudio - the data size of send to audio is: %d", len);
     ssize_t n = send(*fd, data, (size_t)len, MSG_NOSIGNAL);
     if (n < 0 || n < (ssize_t)len) LOGE("lose data when send to audio. errno = %d", errno);

@@ -45,7 +45,8 @@ TEST(AudioLinks, AnswersReachTheHostByteForByte) {
     dev.writeFile("/sim/audio/script",
                   "AT^ALLVER? => \\r\\n^ALLVER: V1\\x00\\x0d\\x0a\\x00end\n"
                   "AUD+BIN => AUD\\x00\\r\\n\\x01\n"
-                  "AUD+TXT => \\r\\nvolume 3\\r\\n\n");
+                  "AUD+TXT => \\r\\nvolume 3\\r\\n\n"
+                  "AUD+LONG => (long 7000) AUD\\x00\\r\\n\n");
     dev.writeFile("/sim/audio/md2.script", "AT+EADP* => \\r\\n+EADP: 2\\r\\n\\r\\nOK\\r\\n\n");
 
     // Device-maker commands: raw, with the line's CR delimiter sent along.
@@ -53,6 +54,10 @@ TEST(AudioLinks, AnswersReachTheHostByteForByte) {
     // Audio commands: the writer passes "AUD..." answers raw, frames the others.
     EXPECT_EQ(bytes("AUD\0\r\n\x01", 7), dev.at("AUD+BIN", true));
     EXPECT_EQ("\r\nvolume 3\r\n", dev.at("AUD+TXT", true));
+    // A raw answer longer than one read stays raw to its last byte.
+    std::string longAnswer = bytes("AUD\0\r\n", 6);
+    while (longAnswer.size() < 7000) longAnswer.push_back(static_cast<char>('a' + longAnswer.size() % 26));
+    EXPECT_TRUE(longAnswer == dev.at("AUD+LONG", true));
     EXPECT_EQ("\r\nOK\r\n", dev.at("MM+LOOP=1", true));
     EXPECT_EQ("\r\n+EADP: 2\r\n\r\nOK\r\n", dev.at("AT+EADP=1", true));
     EXPECT_EQ("\r\nOK\r\n", dev.at("AT+EAPS=0", true));
@@ -60,6 +65,7 @@ TEST(AudioLinks, AnswersReachTheHostByteForByte) {
     EXPECT_EQ("11 AT^ALLVER?\\r\n"
               "8 AUD+BIN\\x00\n"
               "8 AUD+TXT\\x00\n"
+              "9 AUD+LONG\\x00\n"
               "10 MM+LOOP=1\\x00\n",
               dev.readFile("/journal/audio.log"));
     EXPECT_EQ("10 AT+EADP=1\\x00\n"

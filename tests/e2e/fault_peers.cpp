@@ -164,9 +164,9 @@ TEST(FaultPeers, CitApplicationSilentClosingAndKilled) {
         int status = -1;
         d.sim({"stop", "cit"}, &status);
         ASSERT_EQ(0, status);
-        // The verdict on the empty answer (the Null word: OK) arrives once the
-        // application is gone, then the queued line is served.
-        EXPECT_EQ(visible("\r\nOK\r\n" + std::string(kCsdfAnswer)), visible(adb.quiet(500)));
+        // The application went away without answering: no pass, then the
+        // queued line is served.
+        EXPECT_EQ(visible("\r\nERROR\r\n" + std::string(kCsdfAnswer)), visible(adb.quiet(500)));
         d.sim({"start", "cit"}, &status);
         ASSERT_EQ(0, status);
         std::string closed = adb.cmd("AT*CIT_KEY");
@@ -183,6 +183,22 @@ TEST(FaultPeers, CitApplicationSilentClosingAndKilled) {
 
 // An audio answer longer than the daemon reads at once: the host gets its head,
 // and the tail must not pass for the answers to the commands after it.
+// The audio service restarted while the daemon kept its link: the first command
+// afterwards finds the link ended, connects again and is answered.
+TEST(FaultPeersAudio, FirstCommandAfterARestartIsAnswered) {
+    SimDevice d;
+    ASSERT_TRUE(d.started()) << d.upOutput();
+    HostLink adb(d, true);
+    EXPECT_EQ(visible("\r\nOK\r\n"), visible(adb.cmd("AUD+BIN")));
+    for (const char *step : {"stop", "start"}) {
+        int status = -1;
+        d.sim({step, "audio"}, &status);
+        ASSERT_EQ(0, status) << step;
+    }
+    EXPECT_EQ(visible("\r\nOK\r\n"), visible(adb.cmd("AUD+BIN")));
+    EXPECT_EQ(2, countOf(d.readFile("/journal/audio.log"), "AUD+BIN\\x00\n"));
+}
+
 TEST(FaultPeersAudio, OverlongAnswerDoesNotShiftLaterAnswers) {
     SimDevice d;
     ASSERT_TRUE(d.started()) << d.upOutput();
