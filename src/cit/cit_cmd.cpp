@@ -9,6 +9,7 @@
 #include <stdlib.h>
 #include <string.h>
 #include <strings.h>
+#include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
@@ -101,8 +102,12 @@ int cit_readuserat_handler(char *) {
     return 0;
 }
 
+// A pass is answered only for a flag that reached the store: the station records it.
 int cit_writeuserat_handler(char *) {
-    setFlag(FLAG_USER_AT, 0);
+    if (setFlag(FLAG_USER_AT, 0) != 0) {
+        answer(kAnswerError, 9);
+        return 0;
+    }
     NLOGD("(%d)==%d", FLAG_USER_AT, getFlag(FLAG_USER_AT));
     answer("WriteUserAT Pass\r\nOK\r\n", 22);
     return 0;
@@ -150,7 +155,8 @@ int cit_readproinfo_handler(char *line) {
 }
 
 // "=index,value": the low 8 bits of value go into flag index. A line without "="
-// or "," gets no answer at all; an index outside the record is refused.
+// or "," gets no answer at all; an index outside the record, or a value that did
+// not reach the store, is answered with an error.
 int cit_writeproinfo_handler(char *line) {
     char *eq = strchr(line, '=');
     char *comma = strchr(line, ',');
@@ -170,7 +176,10 @@ int cit_writeproinfo_handler(char *line) {
         answer(kAnswerError, 9);
         return 0;
     }
-    setFlag((int)index, (unsigned char)(value & 0xFF));
+    if (setFlag((int)index, (unsigned char)(value & 0xFF)) != 0) {
+        answer(kAnswerError, 9);
+        return 0;
+    }
     answer(kAnswerOk, 6);
     return 0;
 }
@@ -368,7 +377,27 @@ int frameAnswer(char *buf, bool success) {
     return (int)(len + sizeof(kAnswerError) - 1);
 }
 
+// A link kept after an unmatched line may have been closed by the test application
+// since (it restarted). Nothing is ever due on an idle link, so a link that reports
+// a hang-up, an error or anything readable (end of file included) is not reused.
+void dropDeadTestAppLink(void) {
+    if (sock_id < 0) return;
+    struct pollfd p;
+    p.fd = sock_id;
+    p.events = POLLIN | POLLRDHUP;
+    p.revents = 0;
+    int rc;
+    do {
+        rc = poll(&p, 1, 0);
+    } while (rc < 0 && errno == EINTR);
+    if (rc == 0) return;
+    NLOGE("link to %s is no longer usable (revents 0x%x), connecting again", CIT_SOCKET_NAME, (unsigned)p.revents);
+    close(sock_id);
+    sock_id = -1;
+}
+
 int forwardToTestApp(char *line) {
+    dropDeadTestAppLink();
     if (sock_id < 0) {
         sock_id = socket_local_client(CIT_SOCKET_NAME, ANDROID_SOCKET_NAMESPACE_ABSTRACT, SOCK_STREAM);
         if (sock_id < 0) {
@@ -394,8 +423,9 @@ int forwardToTestApp(char *line) {
 
     char result[CIT_ANSWER_SIZE];
     memset(result, 0, sizeof(result));
-    cit_socket_write(row->word, result);
-    int len = frameAnswer(result, answerPasses(row->rule, result));
+    // An answer that never came (the link failed or ended) is never a pass.
+    bool answered = cit_socket_write(row->word, result) > 0;
+    int len = frameAnswer(result, answered && answerPasses(row->rule, result));
     answer(result, len);
     NLOGD(" resultBuf=  %s", result);
     close(sock_id);
@@ -422,6 +452,7 @@ int cit_test_pase(char *line) {
 
 // Sends word with its NUL, then takes one receive as the answer. At most
 // CIT_ANSWER_SIZE - 1 bytes are taken, so the answer is always a terminated text.
+// Returns -1 without a link or a buffer, else the bytes received (0: no answer came).
 int cit_socket_write(const char *word, char *answerBuf) {
     if (sock_id < 0) return -1;
     if (word != nullptr) {
@@ -442,5 +473,5 @@ int cit_socket_write(const char *word, char *answerBuf) {
     else answerBuf[rc] = '\0';
     fprintf(stderr, "[%s]:  buffer : %s\n", "getResult", answerBuf);
     fprintf(stderr, "[%s]:  rc : %d\n", "getResult", (int)rc);
-    return 0;
+    return rc > 0 ? (int)rc : 0;
 }

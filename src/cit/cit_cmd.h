@@ -11,6 +11,8 @@ extern int sock_id;
 
 int cit_test_check(const char *line);
 int cit_test_pase(char *line);
+// Sends word to the test application and receives its answer into answer (at
+// least CIT_ANSWER_SIZE bytes). -1 without a link or buffer, else the answer length.
 int cit_socket_write(const char *word, char *answer);
 
 #endif

@@ -84,30 +84,33 @@ static bool openRecordForSet(F_ID *fid) {
     return true;
 }
 
-void setFlag(int index, unsigned char value) {
+int setFlag(int index, unsigned char value) {
     if (!validIndex(index)) {
         LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Invalid flag index %d", index);
-        return;
+        return -1;
     }
 
     F_ID fid;
-    if (!openRecordForSet(&fid)) return;
+    if (!openRecordForSet(&fid)) return -1;
     unsigned char record[PRODUCT_INFO_SIZE];
     if (!readRecord(fid, record)) {
         LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Read NVRAM fails errno %d\n", errno);
         NVM_CloseFileDesc(fid);
-        return;
+        return -1;
     }
     NVM_CloseFileDesc(fid);
     record[index] = value;
 
     // The record goes back through a second open, whose shape is checked again so
-    // that exactly the bytes just read are written; a failure is logged, since
-    // nobody else would notice it.
-    if (!openRecordForSet(&fid)) return;
+    // that exactly the bytes just read are written. The station records a pass for
+    // what it believes stored, so a write or a close that fails is reported.
+    if (!openRecordForSet(&fid)) return -1;
     ssize_t put = write(fid.iFileDesc, record, sizeof(record));
-    if (put != PRODUCT_INFO_SIZE) {
-        LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Write NVRAM fails errno %d\n", errno);
+    bool stored = put == PRODUCT_INFO_SIZE;
+    if (!stored) LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Write NVRAM fails errno %d\n", errno);
+    if (!NVM_CloseFileDesc(fid) && stored) {
+        LOG_RAW(LOG_LVL_ERROR, NVRAM_LOG_TAG, "Close NVRAM fails errno %d\n", errno);
+        stored = false;
     }
-    NVM_CloseFileDesc(fid);
+    return stored ? 0 : -1;
 }

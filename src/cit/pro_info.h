@@ -10,6 +10,7 @@
 #define FLAG_USER_AT 209
 
 int getFlag(int index);
-void setFlag(int index, unsigned char value);
+// Returns 0 once the new value is stored, -1 when it did not reach the store.
+int setFlag(int index, unsigned char value);
 
 #endif

@@ -4,6 +4,7 @@
 
 #include <unistd.h>
 
+#include <memory>
 #include <string>
 #include <vector>
 
@@ -67,6 +68,21 @@ TEST_F(CitForward, LongAnswersAreCutSoTheFinalResultFits) {
         EXPECT_EQ(framedVerdict(c.shown, c.ok), got)
             << c.answer.size() << " bytes answered, " << got.size() << " bytes shown";
     }
+}
+
+// The link kept after an unmatched line is checked before it is used again: after
+// the application restarted, the command reaches the new one and is judged on its
+// answer, never on the empty answer of the dead link.
+TEST_F(CitForward, KeptLinkToARestartedApplicationIsNotReused) {
+    auto app = std::make_unique<FakeTestApp>();
+    EXPECT_EQ(-1, run("AT*CIT_NOSUCH"));
+    EXPECT_EQ("\r\ntest_fail_no_case\r\nERROR\r\n\r\n", host_.take());
+    ASSERT_GE(sock_id, 0) << "an unmatched line keeps the link";
+    app.reset();  // the application restarts: its link ends, a new one serves
+    app = std::make_unique<FakeTestApp>();
+    app->reply("sn", "SN0042");
+    EXPECT_EQ(0, run("AT*CIT_SN"));
+    EXPECT_EQ(framedVerdict("SN0042", true), host_.take());
 }
 
 }  // namespace

@@ -44,6 +44,18 @@ TEST_F(CitLocal, ProInfoRefusesIndexesOutsideTheRecord) {
     EXPECT_EQ(before, root_.read(kStore));
 }
 
+// The station records a pass for every OK: a flag that did not reach the store is
+// an error, a stored one is answered as always.
+TEST_F(CitLocal, FlagWritesAnswerOkOnlyWhenStored) {
+    EXPECT_EQ("\r\nERROR\r\n", ask("AT*CIT_WRITEPROINFO=202,1")) << "no store";
+    EXPECT_EQ("\r\nERROR\r\n", ask("AT*CIT_WRITEUSERAT"));
+    root_.write(kStore, std::string(PRODUCT_INFO_SIZE, '\x01'));
+    EXPECT_EQ("\r\nOK\r\n", ask("AT*CIT_WRITEPROINFO=202,0"));
+    EXPECT_EQ("\r\nWriteUserAT Pass\r\nOK\r\n", ask("AT*CIT_WRITEUSERAT"));
+    EXPECT_EQ(0, getFlag(202));
+    EXPECT_EQ(0, getFlag(FLAG_USER_AT));
+}
+
 TEST_F(CitLocal, ResultFileEdges) {
     EXPECT_EQ("\r\nERROR\r\n", ask("AT*CIT_WCITF")) << "no folder: neither opened nor created";
     // An existing file keeps its other characters; only character 7 changes.

@@ -13,21 +13,21 @@ const char kStore[] = "/nvram/PRODUCT_INFO";
 TEST(ProInfo, UnusableStoreGivesFallbacksAndIsNeverWritten) {
     TestRoot root;
     EXPECT_EQ(0, getFlag(FLAG_MMI1_RESULT)) << "no store";
-    setFlag(FLAG_MMI1_RESULT, 1);
+    EXPECT_EQ(-1, setFlag(FLAG_MMI1_RESULT, 1));
     EXPECT_FALSE(root.exists(kStore));
 
     const std::string twoRecords(2 * PRODUCT_INFO_SIZE, '\x01');
     root.write(kStore, twoRecords);
     EXPECT_EQ(255, getFlag(FLAG_MMI1_RESULT));
     EXPECT_EQ(255, getFlag(0));
-    setFlag(FLAG_MMI1_RESULT, 0);
+    EXPECT_EQ(-1, setFlag(FLAG_MMI1_RESULT, 0));
     EXPECT_EQ(twoRecords, root.read(kStore));
 
     // One record of the wrong size, declared through the store's shape file.
     root.write(kStore, std::string(2048, '\x01'));
     root.write("/nvram/PRODUCT_INFO.shape", "2048 1");
     EXPECT_EQ(255, getFlag(0));
-    setFlag(0, 0);
+    EXPECT_EQ(-1, setFlag(0, 0));
     EXPECT_EQ(std::string(2048, '\x01'), root.read(kStore));
 }
 
