@@ -41,33 +41,6 @@ static size_t cleanClockValue(const char *in, char *out, size_t size) {
     return n;
 }
 
-// Seconds since the epoch of a broken-down UTC time, whatever zone the process
-// runs in. TZ is put back exactly as it was, including being unset.
-static time_t utcToEpoch(struct tm *tm) {
-    const char *current = getenv("TZ");
-    char *saved = NULL;
-    if (current != NULL) {
-        saved = strdup(current);
-        if (saved == NULL) {
-            errno = ENOMEM;
-            return (time_t)-1;
-        }
-    }
-    setenv("TZ", "UTC", 1);
-    tzset();
-    time_t t = mktime(tm);
-    int mktimeErrno = errno;
-    if (saved != NULL) {
-        setenv("TZ", saved, 1);
-        free(saved);
-    } else {
-        unsetenv("TZ");
-    }
-    tzset();
-    errno = mktimeErrno;
-    return t;
-}
-
 static int cclkSet(const char *param, char *response) {
     char value[CCLK_WORK_SIZE];
     size_t len = cleanClockValue(param, value, sizeof(value));
@@ -105,7 +78,9 @@ static int cclkSet(const char *param, char *response) {
     tm.tm_min = minute;
     tm.tm_sec = second;
     tm.tm_isdst = 0;
-    time_t seconds = utcToEpoch(&tm);
+    // timegm reads the time as UTC without touching TZ: the radio HAL's threads
+    // format log times while this runs, and the environment is not thread-safe.
+    time_t seconds = timegm(&tm);
     if (seconds < 0) {
         LOGD("mktime error: %d %s\n", errno, strerror(errno));
         return RESPONSE_ERROR;
