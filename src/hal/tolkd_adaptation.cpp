@@ -124,10 +124,16 @@ void TolkdAdaptation::sendResponse(const char *data, int length) {
     pthread_mutex_unlock(&mMutex);
 }
 
-void TolkdAdaptation::serviceDied() {
+void TolkdAdaptation::serviceDied(const android::hidl::base::V1_0::IBase *who) {
     LOGD("enter");
     pthread_mutex_lock(&mMutex);
-    for (int i = 0; i < TOLKD_SIM_SLOT_COUNT; i++) mRadio[i].clear();
+    // Only the proxy that died goes. A notice can come late, from a proxy that a
+    // failed send already replaced; the fresh proxy and the answers on it stay.
+    for (int i = 0; i < TOLKD_SIM_SLOT_COUNT; i++) {
+        if (mRadio[i] != nullptr && static_cast<android::hidl::base::V1_0::IBase *>(mRadio[i].get()) == who) {
+            mRadio[i].clear();
+        }
+    }
     pthread_mutex_unlock(&mMutex);
 }
 
@@ -154,9 +160,12 @@ Return<void> TolkIndication::tolkInd(RadioIndicationType, const hidl_vec<uint8_t
     return Void();
 }
 
-void RadioDeathRecipient::serviceDied(uint64_t, const wp<android::hidl::base::V1_0::IBase> &) {
+void RadioDeathRecipient::serviceDied(uint64_t, const wp<android::hidl::base::V1_0::IBase> &who) {
     LOGE("enter");
-    mAdaptation->serviceDied();
+    // A proxy that no longer exists was dropped already, and its old address may
+    // now hold a fresh proxy: only a living one is looked for.
+    sp<android::hidl::base::V1_0::IBase> dead = who.promote();
+    if (dead != nullptr) mAdaptation->serviceDied(dead.get());
 }
 
 static TolkdAdaptation *getAdaptation(void) {

@@ -61,7 +61,8 @@ public:
     static int getSlotId();
     bool sendRequest(const char *data, int length);
     void sendResponse(const char *data, int length);
-    void serviceDied();
+    // Drops the proxy (of whichever slot) that is the service that died.
+    void serviceDied(const android::hidl::base::V1_0::IBase *who);
     // Installs the bridge's end of a new modem pair and closes the previous end.
     void setSocketFd(int fd);
 

@@ -34,6 +34,12 @@ bool slotEmpty(int slot) {
     return empty;
 }
 
+void dropAllProxies() {
+    pthread_mutex_lock(&gTolkdAdaptation->mMutex);
+    for (auto &radio : gTolkdAdaptation->mRadio) radio.clear();
+    pthread_mutex_unlock(&gTolkdAdaptation->mMutex);
+}
+
 // A fresh device root, a host link to capture answers, and a bridge with no proxy
 // and a fresh modem pair.
 class HalBridge : public ::testing::Test {
@@ -46,11 +52,11 @@ protected:
         connectTarget(RIL_TYPE);
         ASSERT_GE(s_fdRild_command, 0);
         ASSERT_NE(nullptr, gTolkdAdaptation);
-        gTolkdAdaptation->serviceDied();
+        dropAllProxies();
     }
     void TearDown() override {
         // Proxies point at this test's services; the next test starts without them.
-        gTolkdAdaptation->serviceDied();
+        dropAllProxies();
         close(s_fdRild_command);
         s_fdRild_command = -1;
     }
@@ -143,7 +149,7 @@ TEST_F(HalBridge, TransportFailureDropsTheProxyAndTheNextRequestSetsUpAgain) {
     EXPECT_EQ(std::string("AT+CSQ\0", 7), frames[3].payload);
 }
 
-TEST_F(HalBridge, ServiceDeathDropsEveryProxyAndTheNextCommandRegistersAgain) {
+TEST_F(HalBridge, ServiceDeathDropsItsOwnProxyOnlyAndTheNextCommandRegistersAgain) {
     FakeRadioService slot1(slotPath("slot1"));
     FakeRadioService slot3(slotPath("slot3"));
     ASSERT_TRUE(slot1.ok() && slot3.ok());
@@ -155,7 +161,8 @@ TEST_F(HalBridge, ServiceDeathDropsEveryProxyAndTheNextCommandRegistersAgain) {
     ASSERT_TRUE(slot3.waitFrames(2));
 
     slot3.dropConnections();
-    ASSERT_TRUE(eventually([] { return slotEmpty(0) && slotEmpty(2); }));
+    ASSERT_TRUE(eventually([] { return slotEmpty(2); }));
+    EXPECT_FALSE(slotEmpty(0)) << "slot 1's service lives on";
 
     ASSERT_TRUE(sendRequest("AT+CGSN", 8));
     ASSERT_TRUE(slot3.waitFrames(4));
@@ -166,6 +173,15 @@ TEST_F(HalBridge, ServiceDeathDropsEveryProxyAndTheNextCommandRegistersAgain) {
     // Answers on the new connection reach the pair.
     ASSERT_TRUE(slot3.respond("OK"));
     EXPECT_EQ("OK", drainFd(s_fdRild_command));
+
+    // A late notice about a proxy that was replaced meanwhile leaves the fresh one.
+    pthread_mutex_lock(&gTolkdAdaptation->mMutex);
+    android::sp<android::hidl::base::V1_0::IBase> old = gTolkdAdaptation->mRadio[2];
+    gTolkdAdaptation->mRadio[2].clear();
+    pthread_mutex_unlock(&gTolkdAdaptation->mMutex);
+    ASSERT_TRUE(sendRequest("AT", 3));
+    gTolkdAdaptation->mDeathRecipient->serviceDied(0, old);
+    EXPECT_FALSE(slotEmpty(2));
 }
 
 TEST_F(HalBridge, NewModemPairReplacesAndClosesTheOldBridgeEnd) {
