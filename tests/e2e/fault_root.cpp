@@ -73,7 +73,7 @@ TEST(FaultRoot, StoresAndDeviceFilesMissingOrMisshaped) {
     const std::string store = root + "/nvram/PRODUCT_INFO";
 
     // The product-information store: missing, too short, a folder. Reads give the
-    // documented fallbacks, writes are answered as before (their failure is logged).
+    // documented fallbacks; a write that cannot be stored answers an error.
     struct StoreCase {
         const char *what;
         std::string userAt;
@@ -87,7 +87,7 @@ TEST(FaultRoot, StoresAndDeviceFilesMissingOrMisshaped) {
         if (std::string(c.what) == "short") d.writeFile("/nvram/PRODUCT_INFO", std::string(10, '\0'));
         if (std::string(c.what) == "folder") mkdir(store.c_str(), 0755);
         EXPECT_EQ(visible(c.userAt), visible(d.at("AT*CIT_ReadUserAT", true)));
-        EXPECT_EQ("\r\nWriteUserAT Pass\r\nOK\r\n", d.at("AT*CIT_WriteUserAT", true));
+        EXPECT_EQ("\r\nERROR\r\n", d.at("AT*CIT_WriteUserAT", true));
         EXPECT_EQ(visible(c.userAt), visible(d.at("AT*CIT_ReadUserAT", true))) << "nothing was written";
     }
     rmdir(store.c_str());
