@@ -1,10 +1,13 @@
-// The simulated modem behind one radio HAL slot: an interpreter of the common
-// V.250 / 3GPP TS 27.007 / 27.005 commands a factory station sends, with the SMS
-// text phase. It turns one request (the bytes the daemon sent, its trailing NUL
-// included) into at most one answer; the transport is the radio peer's business.
+// The simulated modem behind one radio HAL slot: an interpreter of the V.250 and
+// 3GPP TS 27.007 / 27.005 commands that factory stations and host tools send,
+// with the SMS text phase in text and PDU mode. It is as strict as a modem:
+// what it does not know is an error, parameters are checked, and a request that
+// is not a command line plus its NUL is refused before it is interpreted. The
+// transport (frames, serials, answer order) is the radio peer's business.
 #ifndef TOLK_SIM_MODEM_SIM_H
 #define TOLK_SIM_MODEM_SIM_H
 
+#include <map>
 #include <string>
 #include <vector>
 
@@ -23,8 +26,12 @@ public:
     // which slot answered.
     explicit ModemSim(int slot);
 
-    // One request; returns false when the modem stays silent (never for now, but
-    // callers must not rely on an answer), else fills answer.
+    // Why a request breaks the HAL's request format (a command line or a text
+    // line plus its NUL), or "" when it is well formed. Depends on the text phase:
+    // text lines keep their own line end, command lines have none.
+    std::string requestFault(const std::string &request) const;
+    // One well-formed request; fills answer and returns true (a modem always
+    // answers a command line, and prompts for more text).
     bool handle(const std::string &request, std::string *answer);
     // A new client: an unfinished text phase is dropped.
     void reset();
@@ -36,30 +43,50 @@ public:
 
 private:
     enum TextCmd { TextNone, TextCmgs, TextCmgw, TextCmgc, TextCnma };
+    // Outcome of one command of a line.
+    struct Result {
+        enum Kind { Ok, Error, CmeError, CmsError, StartsText } kind = Ok;
+        int code = 0;
+    };
 
     std::string runLine(const std::string &line);
-    // Runs one extended or basic command; appends information text to info.
-    // Returns 0 OK, otherwise an error: -1 plain/CME, -2 a CMS error (cms set).
-    int runCommand(const std::string &cmd, std::string *info, int *cmeCode, bool *startsText);
-    int runBasic(const std::string &cmd, std::string *info);
-    std::string finishText(TextCmd cmd, const std::string &address, const std::string &body, bool pdu);
-    std::string errorText(int cmeCode) const;
+    Result runExtended(const std::string &cmd, std::string *info);
+    Result runBasic(const std::string &cmd, std::string *info);
+    Result openText(const std::string &name, int form, const std::vector<std::string> &args);
+    Result runMerged(const std::string &name, const std::string &params, std::string *info);
+    Result finishText(TextCmd cmd, const std::string &address, const std::string &body, bool pdu,
+                      std::string *info);
+    Result smsParamError() const;
+    std::string resultText(const Result &r) const;
     std::string frame(const std::string &text) const;
+    void factoryDefaults();
 
     int slot_;
     bool echo_ = false;
-    bool verbose_ = true;
     int cmee_ = 0;
     int creg_ = 0;
+    int cgreg_ = 0;
     int cmgf_ = 0;
+    int cfun_ = 1;
+    int csms_ = 0;
+    int copsFormat_ = 0;
+    int cnmi_[5] = {0, 0, 0, 0, 0};
     std::string cscs_ = "IRA";
+    std::string csca_ = "+10000000000";
+    std::map<int, int> sregs_;
     int messageRef_ = 0;
     int nextIndex_ = 1;
     std::vector<StoredSms> store_;
     TextCmd textCmd_ = TextNone;
+    bool textPdu_ = false;
     std::string textAddress_;
     std::string textBody_;
 };
+
+// Whether hex is an SMS PDU as AT+CMGS=<length> announces it in PDU mode: hex
+// digits only (CR and LF between lines are not part of it), an SMSC part whose
+// first octet gives its length, and then exactly length octets of TPDU.
+bool validPdu(const std::string &hex, int length);
 
 }  // namespace tolksim
 

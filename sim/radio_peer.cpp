@@ -1,7 +1,9 @@
 // The simulated radio HAL service: instances "slot1".."slot4", each a simulated
 // modem (or, for slot1, a real modem's serial device) behind the frame wire of
 // radio_wire.h. One thread serves everything from a poll loop, so answers held
-// back by a script never stop the other slots or the URC control socket.
+// back by a script never stop the other slots or the URC control socket. Each
+// slot is one AT channel: its answers leave in the order of its requests, and a
+// request that is not a line plus its NUL is refused and journalled as such.
 #include "modem_script.h"
 #include "modem_sim.h"
 #include "peers.h"
@@ -27,6 +29,8 @@ namespace {
 
 const int kSlots = 4;
 const int kIndicationUnsolicited = 0;
+// What a refused request gets: the plain error a modem gives a line it cannot take.
+const char kRefusedAnswer[] = "\r\nERROR\r\n";
 
 bool wireSend(int fd, uint32_t type, int32_t serial, int32_t extra, const std::string &payload) {
     return radio_wire_send(fd, type, serial, extra, payload.data(), static_cast<uint32_t>(payload.size())) == 0;
@@ -76,6 +80,7 @@ private:
     void dropClient(Slot &s, unsigned id);
     void readClient(Slot &s, unsigned id);
     void answer(Slot &s, unsigned id, int32_t serial, const std::string &request);
+    void queueAnswer(Slot &s, unsigned id, int32_t serial, const ScriptAnswer &sa);
     static Client *findClient(Slot &s, unsigned id);
     static Client *newestRegistered(Slot &s);
     void forwardToTty(const std::string &request);
@@ -137,6 +142,10 @@ void RadioService::answer(Slot &s, unsigned id, int32_t serial, const std::strin
         if (!s.modem->handle(request, &text)) return;
         sa.frames.push_back(text);
     }
+    queueAnswer(s, id, serial, sa);
+}
+
+void RadioService::queueAnswer(Slot &s, unsigned id, int32_t serial, const ScriptAnswer &sa) {
     for (AnswerStep &step : answerSteps(sa, nowMs()))
         pending_.push_back(Pending{s.number, id, serial, std::move(step)});
 }
@@ -155,7 +164,18 @@ void RadioService::readClient(Slot &s, unsigned id) {
         return;
     }
     if (h.type != RADIO_WIRE_REQUEST) return;
-    journalLine(s.journal, visibleBytes(payload));
+    // The HAL takes a command line (or a text line) plus its NUL, nothing else:
+    // a request that breaks that never reaches the modem.
+    std::string fault = s.modem->requestFault(payload);
+    std::string entry = std::to_string(h.serial) + "\t" + visibleBytes(payload);
+    if (!fault.empty()) entry += "\trefused: " + fault;
+    journalLine(s.journal, entry);
+    if (!fault.empty()) {
+        ScriptAnswer refused;
+        refused.frames.push_back(kRefusedAnswer);
+        queueAnswer(s, id, h.serial, refused);
+        return;
+    }
     answer(s, id, h.serial, payload);
 }
 
@@ -227,13 +247,20 @@ void RadioService::serveControl() {
 
 void RadioService::deliverDue() {
     long long now = nowMs();
-    bool released = takeReleaseFile(root_ + "/sim/radio/release");
+    if (takeReleaseFile(root_ + "/sim/radio/release")) {
+        // Released now, even if an earlier answer still holds it back.
+        for (Pending &p : pending_) p.step.hold = false;
+    }
+    // One AT channel per slot answers in request order: a step that is not due
+    // yet holds back every later step of its slot.
+    bool blocked[kSlots] = {};
     std::vector<Pending> keep;
     for (Pending &p : pending_) {
         Slot &s = slots_[p.slot - 1];
         Client *c = findClient(s, p.client);
         if (!c) continue;  // that client is gone
-        if (!p.step.ready(now, released)) {
+        if (blocked[p.slot - 1] || !p.step.ready(now, false)) {
+            blocked[p.slot - 1] = true;
             keep.push_back(p);
             continue;
         }
@@ -279,7 +306,15 @@ int RadioService::run() {
             fds.push_back({ttyFd_, POLLIN, 0});
             what.push_back({-2, 0});
         }
-        int r = poll(fds.data(), fds.size(), stepPollTimeout(pending_, nowMs()));
+        // Only the oldest step of each slot can leave next (see deliverDue).
+        std::vector<Pending> heads;
+        bool seen[kSlots] = {};
+        for (const Pending &p : pending_) {
+            if (seen[p.slot - 1]) continue;
+            seen[p.slot - 1] = true;
+            heads.push_back(p);
+        }
+        int r = poll(fds.data(), fds.size(), stepPollTimeout(heads, nowMs()));
         if (r < 0 && errno != EINTR) break;
         for (size_t k = 0; r > 0 && k < fds.size(); k++) {
             if (!(fds[k].revents & (POLLIN | POLLHUP | POLLERR))) continue;

@@ -50,8 +50,23 @@ private:
     bool adb_;
 };
 
+// The requests a slot received, one rendered request per line as the daemon sent
+// them. The journal's lines are "SERIAL<TAB>REQUEST[<TAB>refused: WHY]"; the
+// daemon sends every request with serial -1, and a refused request keeps its
+// reason here so that no comparison with well-formed requests can pass.
 inline std::string radioJournal(const SimDevice &dev, int slot) {
-    return dev.readFile("/journal/radio.slot" + std::to_string(slot) + ".log");
+    std::string raw = dev.readFile("/journal/radio.slot" + std::to_string(slot) + ".log"), out;
+    size_t pos = 0;
+    while (pos < raw.size()) {
+        size_t end = raw.find('\n', pos);
+        if (end == std::string::npos) end = raw.size();
+        std::string line = raw.substr(pos, end - pos);
+        pos = end + 1;
+        const std::string serial = "-1\t";
+        EXPECT_EQ(line.compare(0, serial.size(), serial), 0) << "journal line: " << line;
+        out += (line.compare(0, serial.size(), serial) == 0 ? line.substr(serial.size()) : line) + "\n";
+    }
+    return out;
 }
 inline std::string genericJournal(const SimDevice &dev) { return dev.readFile("/journal/generic.log"); }
 inline void radioScript(const SimDevice &dev, const std::string &text) { dev.writeFile("/sim/radio/script", text); }

@@ -29,12 +29,14 @@ TEST(ModemRoute, UserModeGateOnProductionBuilds) {
         EXPECT_EQ(visible(host.cmd("AT+SN")), visible("\r\nOK\r\n")) << "adb " << adb;
     }
     // On adb a line ends at CR only: an LF inside it ends nothing, so what follows
-    // it is a command and the line is refused; "AT" with only line ends passes.
+    // it is a command and the line is refused; "AT" with only line ends passes,
+    // LF and all, and the radio HAL refuses a command line that carries a line end.
     HostLink adb(dev, true);
     EXPECT_EQ(visible(adb.cmd("AT\n+CFUN=0")), visible(kRefused));
-    EXPECT_EQ(visible(adb.cmd("AT\n")), visible("\r\nOK\r\n"));
+    EXPECT_EQ(visible(adb.cmd("AT\n")), visible("\r\nERROR\r\n"));
     // Refused lines never reach the modem (nor change the numeric switch).
-    EXPECT_EQ(radioJournal(dev, 1), "AT\\x00\nAT\\x00\nAT\\x00\nAT\\x00\nAT\\n\\x00\n");
+    EXPECT_EQ(radioJournal(dev, 1), "AT\\x00\nAT\\x00\nAT\\x00\nAT\\x00\n"
+                                    "AT\\n\\x00\trefused: line end inside a command line\n");
     EXPECT_EQ(genericJournal(dev), "AT+SN\nAT+SN\n");
 
     // The switch is read for every line: opening it takes effect at once.

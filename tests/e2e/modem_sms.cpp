@@ -17,6 +17,7 @@ TEST(ModemSms, TextIsRelayedLineByLineOnTheSerialPort) {
     SimDevice dev(openModem());
     ASSERT_TRUE(dev.started()) << dev.upOutput();
     HostLink host(dev, false);
+    EXPECT_EQ(visible(host.cmd("AT+CMGF=1")), visible("\r\nOK\r\n"));
     // CR LF from the host makes a second, empty line (a lone LF): it is not text.
     EXPECT_EQ(visible(host.send("AT+CMGS=\"123\"\r\n")), visible(kPrompt));
     EXPECT_EQ(visible(host.cmd("hello")), visible(kPrompt));
@@ -31,6 +32,7 @@ TEST(ModemSms, TextIsRelayedLineByLineOnTheSerialPort) {
     EXPECT_EQ(visible(host.cmd("AT+CMGS=?")), visible("\r\nOK\r\n"));
     EXPECT_EQ(visible(host.cmd("AT+CSQ")), visible("\r\n+CSQ: 20,99\r\n\r\nOK\r\n"));
     EXPECT_EQ(radioJournal(dev, 1),
+              "AT+CMGF=1\\x00\n"
               "AT+CMGS=\"123\"\\x00\n"
               "hello\\n\\x00\n"
               "world\\x1a\\x00\n"
@@ -46,9 +48,11 @@ TEST(ModemSms, TextIsRelayedLineByLineOnTheAdbLink) {
     ASSERT_TRUE(dev.started()) << dev.upOutput();
     HostLink host(dev, true);
     EXPECT_EQ(visible(host.cmd("at+cmgs=\"123\"")), visible(kPrompt));
-    // Text keeps its case, its CR and its backspaces: the modem gets it raw.
+    // Text keeps its case, its CR and its backspaces: the modem gets it raw. (It
+    // is in PDU mode, since AT+CMGF goes to the framework for this operator, and
+    // refuses text that is no PDU; that final result ends the text input too.)
     EXPECT_EQ(visible(host.cmd("Line one")), visible(kPrompt));
-    EXPECT_EQ(visible(host.send("ab\bc\x1a\r")), visible(sent(1)));
+    EXPECT_EQ(visible(host.send("ab\bc\x1a\r")), visible("\r\n+CMS ERROR: 304\r\n"));
     EXPECT_EQ(visible(host.cmd("AT+CMGS?")), visible("\r\nERROR\r\n"));
     // ESC abandons a message; the modem's OK ends the text input.
     EXPECT_EQ(visible(host.cmd("AT+CMGW=\"5\"")), visible(kPrompt));
@@ -104,23 +108,23 @@ TEST(ModemSms, Op12MergesPduModeMessagesAndEscEndsTheText) {
     // output processing on the port), before the answer.
     HostLink host(dev, false, false);
     auto echoed = [](const std::string &line) { return line + "\n"; };
-    // PDU mode is the start-up state: the length alone merges.
-    EXPECT_EQ(visible(host.cmd("AT+CMGS=17")), visible(echoed("AT+CMGS=17") + kPrompt));
-    EXPECT_EQ(visible(host.send("0011AABB\x1a")), visible("0011AABB\x1a" + sent(1)));
+    // PDU mode is the start-up state: the length alone merges. The PDUs are
+    // SMS-SUBMITs of one character to "123", without an SMSC address.
+    const std::string pduA = "000100038121F300000141", pduB = "000100038121F300000142";
+    EXPECT_EQ(visible(host.cmd("AT+CMGS=10")), visible(echoed("AT+CMGS=10") + kPrompt));
+    EXPECT_EQ(visible(host.send(pduA + "\x1a")), visible(pduA + "\x1a" + sent(1)));
     // ESC completes the merged command just like Ctrl-Z.
-    EXPECT_EQ(visible(host.cmd("AT+CMGS=9")), visible(echoed("AT+CMGS=9") + kPrompt));
-    EXPECT_EQ(visible(host.send("00CC\x1b")), visible("00CC\x1b" + sent(2)));
+    EXPECT_EQ(visible(host.cmd("AT+CMGS=10")), visible(echoed("AT+CMGS=10") + kPrompt));
+    EXPECT_EQ(visible(host.send(pduB + "\x1b")), visible(pduB + "\x1b" + sent(2)));
     // The read form of AT+CMGF changes nothing; two parameters in PDU mode do
-    // not merge.
+    // not merge: the line goes to the modem as it is (which refuses it).
     EXPECT_EQ(visible(host.cmd("AT+CMGF?")), visible(echoed("AT+CMGF?") + "\r\n+CMGF: 0\r\n\r\nOK\r\n"));
-    EXPECT_EQ(visible(host.cmd("AT+CMGS=17,1")), visible(echoed("AT+CMGS=17,1") + kPrompt));
-    EXPECT_EQ(visible(host.send("0011\x1a")), visible("0011\x1a" + sent(3)));
+    EXPECT_EQ(visible(host.cmd("AT+CMGS=17,1")), visible(echoed("AT+CMGS=17,1") + "\r\n+CMS ERROR: 304\r\n"));
     EXPECT_EQ(radioJournal(dev, 1),
-              "AT+EMGS=17,\"0011AABB\"\\r\\n\\x00\n"
-              "AT+EMGS=9,\"00CC\"\\r\\n\\x00\n"
+              "AT+EMGS=10,\"" + pduA + "\"\\r\\n\\x00\n"
+              "AT+EMGS=10,\"" + pduB + "\"\\r\\n\\x00\n"
               "AT+CMGF?\\x00\n"
-              "AT+CMGS=17,1\\x00\n"
-              "0011\\x1a\\x00\n");
+              "AT+CMGS=17,1\\x00\n");
 
     // With the CDMA modem selected nothing is merged, and a relayed text line
     // that ends with ESC reaches the modem with it.
@@ -129,6 +133,6 @@ TEST(ModemSms, Op12MergesPduModeMessagesAndEscEndsTheText) {
     EXPECT_EQ(visible(host.send("0011\x1b")), visible("0011\x1b\r\nOK\r\n"));
     EXPECT_EQ(visible(host.cmd("AT")), visible(echoed("AT") + "\r\nOK\r\n"));
     std::string journal = radioJournal(dev, 1);
-    EXPECT_NE(journal.find("0011\\x1a\\x00\nAT+CMGS=17\\x00\n0011\\x1b\\x00\nAT\\x00\n"), std::string::npos)
+    EXPECT_NE(journal.find("AT+CMGS=17,1\\x00\nAT+CMGS=17\\x00\n0011\\x1b\\x00\nAT\\x00\n"), std::string::npos)
         << journal;
 }

@@ -48,6 +48,12 @@ void sendFrame(int fd, uint32_t type, const std::string &text = "") {
     ASSERT_EQ(radio_wire_send(fd, type, -1, 0, payload.data(), static_cast<uint32_t>(payload.size())), 0);
 }
 
+// A request with exactly these bytes and serial.
+void sendRaw(int fd, int32_t serial, const std::string &payload) {
+    ASSERT_EQ(radio_wire_send(fd, RADIO_WIRE_REQUEST, serial, 0, payload.data(), static_cast<uint32_t>(payload.size())),
+              0);
+}
+
 // The payload of the next frame; "<none>" when nothing comes within ms.
 std::string recvFrame(int fd, RadioWireHeader *h, int ms = 2000) {
     struct pollfd p = {fd, POLLIN, 0};
@@ -81,7 +87,7 @@ TEST(RadioPeer, AnswersOnlyAfterRegisterAndJournalsEveryRequest) {
     sendFrame(fd, RADIO_WIRE_REQUEST, "AT+CMGS=\"1\"");
     EXPECT_EQ(recvFrame(fd, &h), "\r\n> ");
     EXPECT_EQ(peer.root_.read("/journal/radio.slot2.log"),
-              "AT+CGSN\\x00\nAT+CGSN\\x00\nAT+CMGS=\"1\"\\x00\n");
+              "-1\tAT+CGSN\\x00\n-1\tAT+CGSN\\x00\n-1\tAT+CMGS=\"1\"\\x00\n");
     EXPECT_EQ(peer.root_.read("/journal/radio.slot1.log"), "");
 
     // The daemon reconnects after it saw the service die: a new connection is
@@ -93,4 +99,40 @@ TEST(RadioPeer, AnswersOnlyAfterRegisterAndJournalsEveryRequest) {
     EXPECT_EQ(recvFrame(fd, &h), "\r\nOK\r\n");
     close(fd);
     EXPECT_EQ(peer.stop(), 0);
+}
+
+TEST(RadioPeer, RefusesWhatIsNoLinePlusNulAndAnswersInRequestOrder) {
+    Peer peer;
+    peer.root_.write("/sim/radio/script", "AT+SLOW => (delay 300) \\r\\n+SLOW: 1\\r\\n\\r\\nOK\\r\\n\n");
+    int fd = connectSlot(peer, 1);
+    ASSERT_GE(fd, 0);
+    sendFrame(fd, RADIO_WIRE_REGISTER);
+    RadioWireHeader h;
+    // Each refusal is answered like a line the modem cannot take, with the
+    // request's own serial, and leaves the modem as it was.
+    const std::string kError = "\r\nERROR\r\n";
+    sendRaw(fd, 7, "AT+CSQ");
+    EXPECT_EQ(recvFrame(fd, &h), kError);
+    EXPECT_EQ(h.serial, 7);
+    sendRaw(fd, -1, std::string("AT+CMGS=\"1\"\r\n\0", 14));
+    EXPECT_EQ(recvFrame(fd, &h), kError);
+    sendRaw(fd, -1, std::string("AT\0AT\0", 6));
+    EXPECT_EQ(recvFrame(fd, &h), kError);
+    sendRaw(fd, -1, std::string("AT+EMGS=\"1\",,\"hi\"\0", 18));
+    EXPECT_EQ(recvFrame(fd, &h), kError);
+    sendRaw(fd, -1, std::string("AT+CSQ\0", 7));
+    EXPECT_EQ(recvFrame(fd, &h), "\r\n+CSQ: 20,99\r\n\r\nOK\r\n");
+    EXPECT_EQ(peer.root_.read("/journal/radio.slot1.log"),
+              "7\tAT+CSQ\trefused: no NUL at the end\n"
+              "-1\tAT+CMGS=\"1\"\\r\\n\\x00\trefused: line end inside a command line\n"
+              "-1\tAT\\x00AT\\x00\trefused: NUL inside the request\n"
+              "-1\tAT+EMGS=\"1\",,\"hi\"\\x00\trefused: merged SMS line without its closing quote and CR LF\n"
+              "-1\tAT+CSQ\\x00\n");
+
+    // One channel: a slow answer holds back the answers of later requests.
+    sendFrame(fd, RADIO_WIRE_REQUEST, "AT+SLOW");
+    sendFrame(fd, RADIO_WIRE_REQUEST, "AT+CGSN");
+    EXPECT_EQ(recvFrame(fd, &h), "\r\n+SLOW: 1\r\n\r\nOK\r\n");
+    EXPECT_EQ(recvFrame(fd, &h), "\r\n350000000000001\r\n\r\nOK\r\n");
+    close(fd);
 }

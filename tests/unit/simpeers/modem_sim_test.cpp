@@ -1,0 +1,121 @@
+// The simulated modem as a strict modem: what host tools send is answered as
+// V.250 and 27.007/27.005 say, and what a modem would refuse is refused.
+#include "../../../sim/modem_sim.h"
+
+#include <gtest/gtest.h>
+
+using namespace tolksim;
+
+namespace {
+
+std::string ok(const std::string &info = "") { return info + "\r\nOK\r\n"; }
+std::string line(const std::string &text) { return "\r\n" + text + "\r\n"; }
+const char kPrompt[] = "\r\n> ";
+
+// Runs each request (given without its NUL) in turn on one modem.
+void expectDialogue(ModemSim &m, const std::vector<std::pair<std::string, std::string>> &steps) {
+    for (const auto &step : steps) {
+        std::string request = step.first + std::string(1, '\0'), answer;
+        ASSERT_EQ(m.requestFault(request), "") << step.first;
+        ASSERT_TRUE(m.handle(request, &answer));
+        EXPECT_EQ(answer, step.second) << "request: " << step.first;
+    }
+}
+
+}  // namespace
+
+TEST(ModemSim, AnswersWhatHostToolsSend) {
+    ModemSim m(2);
+    expectDialogue(m, {
+        // A dialer's set-up lines: basic commands with blanks between them.
+        {"ATQ0 V1 E0 S0=0 &C1 &D2 +FCLASS=0", ok()},
+        {"ATS0?", ok(line("000"))},
+        {"ATS7=30;S7?", ok(line("030"))},
+        {"AT&D3", line("ERROR")},
+        {"ATS99=1", line("ERROR")},
+        {"ATE0Z", ok()},
+        {"ATI", ok(line("TOLK-SIM\r\nTSM-100\r\nRevision: TSM-100 V1.0.2"))},
+        {"AT+GMI;+CGSN", ok(line("TOLK-SIM") + line("350000000000002"))},
+        {"AT+CGMR=1", line("ERROR")},
+        // Errors follow +CMEE, which ATZ resets.
+        {"AT+NOSUCH", line("ERROR")},
+        {"AT+CMEE=1", ok()},
+        {"AT+NOSUCH", line("+CME ERROR: 4")},
+        {"AT+CREG=3", line("+CME ERROR: 50")},
+        {"AT+CMEE=2", ok()},
+        {"AT+CFUN=2", line("+CME ERROR: Incorrect parameters")},
+        {"ATZ", ok()},
+        {"AT+CMEE?", ok(line("+CMEE: 0"))},
+        // Status a phone tool reads; the cell shows with <n>=2.
+        {"AT+CREG=2;+CREG?", ok(line("+CREG: 2,1,\"0001\",\"00000101\",7"))},
+        {"AT+COPS=3,2;+COPS?", ok(line("+COPS: 0,2,\"00101\",7"))},
+        {"AT+CPIN?;+CSQ", ok(line("+CPIN: READY") + line("+CSQ: 20,99"))},
+        {"AT+CSCA?", ok(line("+CSCA: \"+10000000000\",145"))},
+        {"AT+CSMS=1", ok(line("+CSMS: 1,1,1"))},
+        {"AT+CPMS=\"ME\"", line("+CMS ERROR: 302")},
+    });
+}
+
+TEST(ModemSim, SmsTextPhaseOnlyWithWhatTheModeNeeds) {
+    const std::string pdu = "000100038121F300000141";  // 10 octets of TPDU
+    ModemSim m(1);
+    expectDialogue(m, {
+        // PDU mode: a length is needed, and the PDU must be hex of that length
+        // after its SMSC part. SMS errors ignore +CMEE.
+        {"AT+CMGS=", line("+CMS ERROR: 304")},
+        {"AT+CMGS=\"\"", line("+CMS ERROR: 304")},
+        {"AT+CMGC=", line("+CMS ERROR: 304")},
+        {"AT+CMGS=10,1", line("+CMS ERROR: 304")},
+        {"AT+CMGS?", line("ERROR")},
+        {"AT+CMGS=10", kPrompt},
+        {pdu + "\x1a", ok(line("+CMGS: 1"))},
+        {"AT+CMGS=11", kPrompt},
+        {pdu + "\x1a", line("+CMS ERROR: 304")},
+        {"AT+CMGW=10", kPrompt},
+        {"0001000381\r", kPrompt},  // a PDU over two lines
+        {"21F300000141\x1a", ok(line("+CMGW: 1"))},
+        {"AT+CMGS=1", kPrompt},
+        {"0G\x1a", line("+CMS ERROR: 304")},
+        {"AT+CMGS=1", kPrompt},
+        {"zz\x1b", ok()},  // ESC abandons whatever was typed
+        {"AT+CNMA=0,0", ok()},  // no PDU: nothing to type
+        {"AT+EMGS=10,\"" + pdu + "\"\r\n", ok(line("+CMGS: 2"))},
+        {"AT+EMGS=9,\"" + pdu + "\"\r\n", line("+CMS ERROR: 304")},
+        // Text mode: a destination is needed, the text is anything.
+        {"AT+CMGF=1", ok()},
+        {"AT+CMGS=\"\"", line("+CMS ERROR: 305")},
+        {"AT+CMGS", line("+CMS ERROR: 305")},
+        {"AT+CMGS=\"123\",129", kPrompt},
+        {"hello\r", kPrompt},
+        {"world\x1a", ok(line("+CMGS: 3"))},
+        {"AT+EMGW=\"5\",,\"a,b\nc\"\r\n", ok(line("+CMGW: 2"))},
+        {"AT+EMGS=\"\",,\"x\"\r\n", line("+CMS ERROR: 305")},
+        {"AT+CMGR=2", ok(line("+CMGR: \"STO UNSENT\",\"5\",\r\na,b\nc"))},
+        {"AT+CMGR=9", line("+CMS ERROR: 321")},
+    });
+}
+
+TEST(ModemSim, RequestFormat) {
+    ModemSim m(1);
+    const std::string nul(1, '\0');
+    struct Case {
+        std::string request, fault;
+    } cases[] = {
+        {"AT+CSQ", "no NUL at the end"},
+        {"", "no NUL at the end"},
+        {"AT+CSQ" + nul + "x" + nul, "NUL inside the request"},
+        {"AT+CSQ\r\n" + nul, "line end inside a command line"},
+        {"AT\rAT" + nul, "line end inside a command line"},
+        {"AT+EMGS=\"1\",,\"hi\"" + nul, "merged SMS line without its closing quote and CR LF"},
+        {"AT+EMGS=\"1\",,\"hi\r\n" + nul, "merged SMS line without its closing quote and CR LF"},
+        {"AT+EMGS=1\"\r\n" + nul, "merged SMS line without a quoted text"},
+        {"AT+EMGS=\"1\",,\"h\ni\"\r\n" + nul, ""},
+        {"AT+CSQ" + nul, ""},
+    };
+    for (const Case &c : cases) EXPECT_EQ(m.requestFault(c.request), c.fault) << c.request;
+    // Text lines keep the line end the host typed.
+    std::string answer;
+    m.handle("AT+CMGS=1" + nul, &answer);
+    EXPECT_EQ(m.requestFault("hello\r\n" + nul), "");
+    EXPECT_EQ(m.requestFault("hello\r\n"), "no NUL at the end");
+}
