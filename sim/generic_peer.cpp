@@ -1,6 +1,6 @@
-// The simulated generic framework service on "tolk-service": it records every
-// message it receives and answers command texts from its script (a framed OK
-// by default). Answers may be held back or delayed per command; the service
+// The simulated generic framework service on "tolk-service": it cuts what it
+// reads into the daemon's messages (GenericSplitter), records every message and
+// answers command texts from its script (a framed OK by default). Answers may be held back or delayed per command; the service
 // keeps reading and answering other messages meanwhile, so a test can tell a
 // daemon that waits for one answer from one that does not.
 #include "modem_script.h"
@@ -18,6 +18,7 @@
 
 #include <algorithm>
 #include <cstdio>
+#include <map>
 
 using namespace tolksim;
 
@@ -39,6 +40,7 @@ public:
 
 private:
     void receive(int fd);
+    void serve(int fd, const std::string &msg);
     void dropClient(int fd);
     void deliverDue();
 
@@ -49,9 +51,14 @@ private:
     std::string socketPath_;
     std::vector<int> clients_;
     std::vector<Pending> pending_;
+    std::map<int, GenericSplitter> splitters_;  // per connection: what was read of its messages
 };
 
 void GenericService::dropClient(int fd) {
+    // An MMI answer cut short by the end of the link is recorded as far as it came.
+    std::string rest = splitters_[fd].flush();
+    if (!rest.empty()) journalLine(journal_, visibleBytes(rest));
+    splitters_.erase(fd);
     close(fd);
     clients_.erase(std::remove(clients_.begin(), clients_.end(), fd), clients_.end());
     pending_.erase(std::remove_if(pending_.begin(), pending_.end(), [fd](const Pending &p) { return p.fd == fd; }),
@@ -66,9 +73,11 @@ void GenericService::receive(int fd) {
         dropClient(fd);
         return;
     }
-    std::string msg(buf, static_cast<size_t>(n));
-    journalLine(journal_, visibleBytes(msg));
+    for (const std::string &msg : splitters_[fd].feed(std::string(buf, static_cast<size_t>(n)))) serve(fd, msg);
+}
 
+void GenericService::serve(int fd, const std::string &msg) {
+    journalLine(journal_, visibleBytes(msg));
     ScriptAnswer sa;
     if (!script_.lookup(msg, &sa)) {
         // MMI feedback ("command+ORVTOLKJ" + modem answer + ";") only informs the

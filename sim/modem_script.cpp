@@ -5,7 +5,9 @@
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <cctype>
 #include <cstdio>
+#include <cstring>
 #include <fstream>
 
 namespace tolksim {
@@ -146,6 +148,85 @@ bool takeReleaseFile(const std::string &path) {
     if (access(path.c_str(), F_OK) != 0) return false;
     unlink(path.c_str());
     return true;
+}
+
+namespace {
+
+const char kMmiMark[] = "+ORVTOLKJ";
+// An MMI answer is a modem answer with a short prefix; one that grows past this
+// without its ";" is not going to get one.
+const size_t kMaxKeptAnswer = 64 * 1024;
+
+// Whether a framework command begins at i: the daemon upper-cases the name, and
+// every one starts with "AT+" or "AT%".
+bool commandStartsAt(const std::string &s, size_t i) {
+    return s.compare(i, 3, "AT+") == 0 || s.compare(i, 3, "AT%") == 0;
+}
+
+void splitCommands(const std::string &text, std::vector<std::string> *out) {
+    size_t start = 0;
+    bool quoted = false;
+    for (size_t i = 0; i < text.size(); i++) {
+        if (text[i] == '"') quoted = !quoted;
+        if (!quoted && i > start && commandStartsAt(text, i)) {
+            out->push_back(text.substr(start, i - start));
+            start = i;
+        }
+    }
+    if (start < text.size()) out->push_back(text.substr(start));
+}
+
+// Where the stored text in front of the mark at mark begins: the "AT" of the
+// command name, behind the operation mark. from when it cannot be found.
+size_t mmiStart(const std::string &s, size_t from, size_t mark) {
+    size_t j = mark;
+    if (j >= from + 2 && s.compare(j - 2, 2, "=?") == 0) j -= 2;
+    else if (j > from && (s[j - 1] == '=' || s[j - 1] == '?')) j--;
+    while (j > from && std::isalnum(static_cast<unsigned char>(s[j - 1]))) j--;
+    if (j > from && std::strchr("+%^$*#&", s[j - 1])) j--;
+    if (j >= from + 2 && s.compare(j - 2, 2, "AT") == 0) return j - 2;
+    return from;
+}
+
+// The ";" that ends an MMI answer whose text goes on at from, or npos.
+size_t mmiEnd(const std::string &s, size_t from) {
+    for (size_t i = s.find(';', from); i != std::string::npos; i = s.find(';', i + 1)) {
+        if (i + 1 == s.size() || commandStartsAt(s, i + 1)) return i;
+    }
+    return std::string::npos;
+}
+
+}  // namespace
+
+std::vector<std::string> GenericSplitter::feed(const std::string &bytes) {
+    std::string buf = pending_ + bytes;
+    pending_.clear();
+    std::vector<std::string> out;
+    size_t pos = 0;
+    while (pos < buf.size()) {
+        size_t mark = buf.find(kMmiMark, pos);
+        if (mark == std::string::npos) {
+            splitCommands(buf.substr(pos), &out);
+            break;
+        }
+        size_t start = mmiStart(buf, pos, mark);
+        if (start > pos) splitCommands(buf.substr(pos, start - pos), &out);
+        size_t end = mmiEnd(buf, mark + strlen(kMmiMark));
+        if (end == std::string::npos) {
+            pending_ = buf.substr(start);
+            if (pending_.size() > kMaxKeptAnswer) out.push_back(flush());
+            break;
+        }
+        out.push_back(buf.substr(start, end + 1 - start));
+        pos = end + 1;
+    }
+    return out;
+}
+
+std::string GenericSplitter::flush() {
+    std::string kept;
+    kept.swap(pending_);
+    return kept;
 }
 
 int listenUnix(const std::string &path, int backlog) {

@@ -90,6 +90,31 @@ private:
     std::vector<ScriptRule> rules_;
 };
 
+// The generic service link has no framing: the daemon writes each command text,
+// and each MMI answer (stored text ending in "+ORVTOLKJ", the modem's answer, and
+// ";"), with one send and no terminator, so one read may hold several of them or
+// part of an MMI answer. This cuts what a connection delivers into those messages
+// where they can be told apart:
+//  - an MMI answer starts at the "AT" of the command name in front of the mark
+//    (and of its "=", "=?" or "?"), and ends at the first ";" after the mark that
+//    is followed by the next message ("AT+" or "AT%") or by the end of what has
+//    arrived; without such a ";" the answer is kept until more arrives;
+//  - command texts are cut before every "AT+" or "AT%" outside double quotes, the
+//    beginnings of the framework commands.
+class GenericSplitter {
+public:
+    // The complete messages, in order, once bytes are added.
+    std::vector<std::string> feed(const std::string &bytes);
+    // What is kept back: the start of an MMI answer whose ";" has not come.
+    const std::string &pending() const { return pending_; }
+    // Gives up on a kept answer (the link ended, or it grew without bound): it is
+    // returned as it is.
+    std::string flush();
+
+private:
+    std::string pending_;
+};
+
 // Binds and listens on an AF_UNIX stream socket at path (an old file is removed,
 // missing folders are made). Returns the descriptor or -1, saying why on stderr.
 int listenUnix(const std::string &path, int backlog = 4);

@@ -43,3 +43,35 @@ TEST(ScriptFormat, FileIsReReadWhenItChanges) {
     EXPECT_FALSE(file.lookup("AT+CSQ", &a));
     rmdir(dir);
 }
+
+// The generic link has no framing: what one read brings is cut into the
+// daemon's messages, and an MMI answer cut by the reads is put together again.
+TEST(GenericSplitter, CutsReadsIntoCommandsAndMmiAnswers) {
+    using Messages = std::vector<std::string>;
+    const std::string mmi = "AT+CPIN=+ORVTOLKJ\r\n+CPIN: READY\r\n\r\nOK\r\n;";
+    struct Case {
+        std::vector<std::string> reads;
+        Messages messages;
+    } cases[] = {
+        {{"AT+SN"}, {"AT+SN"}},
+        {{"AT+SNAT+CPIN=+ORVTOLKJ\r\nOK\r\n;"}, {"AT+SN", "AT+CPIN=+ORVTOLKJ\r\nOK\r\n;"}},
+        {{mmi + "AT%OSVER" + mmi}, {mmi, "AT%OSVER", mmi}},
+        {{"AT+SNAT+MODEL", "AT%TEST=\"AT+X;\"AT+SN"}, {"AT+SN", "AT+MODEL", "AT%TEST=\"AT+X;\"", "AT+SN"}},
+        // The answer's own ";" is not its end while more of it follows.
+        {{"AT+CPIN?+ORVTOLKJ\r\n+X: a;b\r\n;AT+SN"}, {"AT+CPIN?+ORVTOLKJ\r\n+X: a;b\r\n;", "AT+SN"}},
+        {{"AT+MODELAT+CPIN=+ORVTOLKJ\r\n+CPIN:", " READY\r\n", "\r\nOK\r\n;AT+SN"},
+         {"AT+MODEL", mmi, "AT+SN"}},
+    };
+    for (const Case &c : cases) {
+        GenericSplitter split;
+        Messages got;
+        for (const std::string &r : c.reads)
+            for (const std::string &m : split.feed(r)) got.push_back(m);
+        EXPECT_EQ(got, c.messages) << c.reads.front();
+        EXPECT_EQ(split.pending(), "");
+    }
+    // An answer the link ends in the middle of is handed over as far as it came.
+    GenericSplitter split;
+    EXPECT_EQ(split.feed("AT+CPIN=+ORVTOLKJ\r\n+CP"), Messages{});
+    EXPECT_EQ(split.flush(), "AT+CPIN=+ORVTOLKJ\r\n+CP");
+}
