@@ -3,7 +3,7 @@
 # Runs before every configure; does nothing (and needs no network) once they are there.
 set -eu
 need=()
-for pkg in cmake g++ make libgtest-dev libgmock-dev libbenchmark-dev python3-serial; do
+for pkg in cmake g++ make libgtest-dev libgmock-dev libbenchmark-dev python3-serial gammu gsm-utils wvdial; do
   dpkg -s "$pkg" >/dev/null 2>&1 || need+=("$pkg")
 done
 [ ${#need[@]} -eq 0 ] && exit 0
