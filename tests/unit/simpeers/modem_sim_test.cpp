@@ -84,6 +84,7 @@ TEST(ModemSim, SmsTextPhaseOnlyWithWhatTheModeNeeds) {
         // Text mode: a destination is needed, the text is anything.
         {"AT+CMGF=1", ok()},
         {"AT+CMGS=\"\"", line("+CMS ERROR: 305")},
+        {"AT+CNMA=0,1", line("+CMS ERROR: 305")},  // text mode acknowledges without a PDU
         {"AT+CMGS", line("+CMS ERROR: 305")},
         {"AT+CMGS=\"123\",129", kPrompt},
         {"hello\r", kPrompt},

@@ -103,7 +103,9 @@ TEST(RadioPeer, AnswersOnlyAfterRegisterAndJournalsEveryRequest) {
 
 TEST(RadioPeer, RefusesWhatIsNoLinePlusNulAndAnswersInRequestOrder) {
     Peer peer;
-    peer.root_.write("/sim/radio/script", "AT+SLOW => (delay 300) \\r\\n+SLOW: 1\\r\\n\\r\\nOK\\r\\n\n");
+    peer.root_.write("/sim/radio/script",
+                     "AT+SLOW => (delay 300) \\r\\n+SLOW: 1\\r\\n\\r\\nOK\\r\\n\n"
+                     "AT+HELD => (hold) \\r\\n+HELD: 1\\r\\n\\r\\nOK\\r\\n\n");
     int fd = connectSlot(peer, 1);
     ASSERT_GE(fd, 0);
     sendFrame(fd, RADIO_WIRE_REGISTER);
@@ -129,10 +131,16 @@ TEST(RadioPeer, RefusesWhatIsNoLinePlusNulAndAnswersInRequestOrder) {
               "-1\tAT+EMGS=\"1\",,\"hi\"\\x00\trefused: merged SMS line without its closing quote and CR LF\n"
               "-1\tAT+CSQ\\x00\n");
 
-    // One channel: a slow answer holds back the answers of later requests.
+    // One channel: a slow answer holds back the answers of later requests; a
+    // held one released meanwhile follows it.
     sendFrame(fd, RADIO_WIRE_REQUEST, "AT+SLOW");
+    sendFrame(fd, RADIO_WIRE_REQUEST, "AT+HELD");
     sendFrame(fd, RADIO_WIRE_REQUEST, "AT+CGSN");
+    ASSERT_TRUE(eventually(
+        [&] { return peer.root_.read("/journal/radio.slot1.log").find("CGSN") != std::string::npos; }));
+    peer.root_.write("/sim/radio/release", "");
     EXPECT_EQ(recvFrame(fd, &h), "\r\n+SLOW: 1\r\n\r\nOK\r\n");
+    EXPECT_EQ(recvFrame(fd, &h), "\r\n+HELD: 1\r\n\r\nOK\r\n");
     EXPECT_EQ(recvFrame(fd, &h), "\r\n350000000000001\r\n\r\nOK\r\n");
     close(fd);
 }
