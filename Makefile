@@ -4,7 +4,7 @@ BUILD_TYPE ?= RelWithDebInfo
 CMAKE_FLAGS ?=
 JOBS ?= $(shell nproc 2>/dev/null || echo 2)
 
-.PHONY: all run test deps configure build clean asan bench
+.PHONY: all run test deps configure build clean asan bench test-arm64
 
 all: build
 
@@ -27,6 +27,11 @@ test: build
 # The whole suite under AddressSanitizer and UndefinedBehaviorSanitizer.
 asan:
 	$(MAKE) test BUILD=build-asan BUILD_TYPE=Debug CMAKE_FLAGS=-DTOLKD_SANITIZE=ON
+
+# tolkd cross-built for 64-bit Arm and run under qemu-user inside the x86-64
+# simulated device (build-arm64/, build-arm64-host/; docs/ARM64.md).
+test-arm64:
+	tools/test-arm64.sh
 
 # Every performance measurement on a fresh simulated device, as one table.
 bench: deps

@@ -1,9 +1,12 @@
 #!/usr/bin/env bash
 # Installs the Debian packages the build and the tests need, when they are missing.
 # Runs before every configure; does nothing (and needs no network) once they are there.
+# `ensure-deps.sh arm64` adds the aarch64 cross toolchain and qemu-user (make test-arm64).
 set -eu
+pkgs=(cmake g++ make libgtest-dev libgmock-dev libbenchmark-dev python3-serial gammu gsm-utils wvdial)
+[ "${1:-}" = arm64 ] && pkgs+=(g++-aarch64-linux-gnu qemu-user)
 need=()
-for pkg in cmake g++ make libgtest-dev libgmock-dev libbenchmark-dev python3-serial gammu gsm-utils wvdial; do
+for pkg in "${pkgs[@]}"; do
   dpkg -s "$pkg" >/dev/null 2>&1 || need+=("$pkg")
 done
 [ ${#need[@]} -eq 0 ] && exit 0
