@@ -140,7 +140,7 @@ bool parseStmt(const std::string &line, Stmt *st) {
     }
     if (!std::regex_match(line, m, otherRe)) return false;
     st->verb = m[1], st->a = m[2], st->b = m[3];
-    if (st->verb == "log" || st->verb == "sim") st->b = st->a + (st->b.empty() ? "" : " " + st->b);
+    if (st->verb == "log" || st->verb == "sim") st->b = sim::trimBlanks(line.substr(st->verb.size()));
     if (st->verb == "quiet") st->timeoutMs = atoi(st->a.c_str());
     if (st->verb == "setprop" || st->verb == "write") return decode(st->b, 0, &p) && (st->b = bytesOf(p), true);
     return true;
@@ -267,8 +267,10 @@ public:
             int status = dev.sim->tolkdExitStatus(0);
             if (status != -1) fail(g.line, "tolkd ended during the group with status " + std::to_string(status));
             // A device that goes down now prints its log itself.
+            std::string log = dev.sim->log();
             if (::testing::Test::HasFailure() && !g.fresh && sharedLater)
-                fprintf(stderr, "---- tolkd log ----\n%s---- end ----\n", dev.sim->log().c_str());
+                fprintf(stderr, "---- end of the tolkd log ----\n%s---- end ----\n",
+                        log.substr(log.size() > 6000 ? log.size() - 6000 : 0).c_str());
         }
         // The shared device goes down inside the last test that uses it, so that
         // its sanitizer check and log land in a test.
