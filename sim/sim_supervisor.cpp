@@ -284,6 +284,9 @@ void Supervisor::shutdownAll() {
         unlink(L_.pidFile(p.first).c_str());
     }
     reapChildren();
+    setCable(false);  // the device is gone: a host sees its carrier drop
+    if (linesFd_ >= 0) close(linesFd_);
+    linesFd_ = -1;
     unlink(L_.ctlSocket().c_str());
     unlink(L_.pidFile("supervisor").c_str());
     log("down");
