@@ -242,7 +242,7 @@ static int acceptAdbConnection(SerialDevice *dev) {
 // Turns a complete host line of n bytes in lineBuf into the command line in cmdBuf.
 // Returns cmdBuf, or NULL when the line is no command and is dropped.
 static char *acceptLine(SerialDevice *dev, int n) {
-    LOGD("state %d with %d:%d", dev->state, 0, lineBuf[0]);
+    LOGD("state %d with %d:%d", dev->state, 0, (unsigned char)lineBuf[0]);
 
     // SMS body text; a lone LF is only the tail of the command line's CR LF.
     if (isMsgCmdInput && !(n == 1 && lineBuf[0] == '\n')) return handleMsgTextLine(dev, lineBuf, n);
@@ -360,7 +360,7 @@ char *readline(SerialDevice *dev) {
 
         int n = readFromHost(dev, slot, buf);
         if (n < 0) return NULL;
-        LOGD("the readCount is %d with %s:%d", n, buf, buf[0]);
+        LOGD("the readCount is %d with %s:%d", n, buf, (unsigned char)buf[0]);
         if (tolk_conn_mode == CONN_MODE_VCOM) {
             LOGD("VCOM mode, sleep 0.01s");
             usleep(10 * 1000);
