@@ -99,9 +99,6 @@ void Supervisor::setCable(bool in) {
 }
 
 std::string Supervisor::replug() {
-    // The host sees the carrier drop and come back, as when a cable is pulled
-    // and plugged in again.
-    setCable(false);
     PtyPair fresh;
     std::string err;
     if (!openPty(&fresh, &err)) return "error: " + err + "\n";
@@ -111,7 +108,9 @@ std::string Supervisor::replug() {
         return "error: cannot relink " + L_.deviceTty() + "\n";
     }
     // Closing the old master hangs the old port up: tolkd's read fails and it
-    // reopens /dev/ttyGS0, which now names the fresh terminal.
+    // reopens /dev/ttyGS0, which now names the fresh terminal. The host sees
+    // its carrier drop and come back, as when a cable is pulled and plugged in.
+    setCable(false);
     if (dev_.master >= 0) close(dev_.master);
     if (dev_.slave >= 0) close(dev_.slave);
     dev_ = fresh;
