@@ -1,6 +1,6 @@
-// An in-test stand-in for the simulated radio service: listens on the socket of one
-// instance under the current device root, records the frames its clients send and
-// lets the test send answers and indications or cut the connections.
+// An in-test radio service: listens on the socket of one instance under the
+// current device root, records the frames its clients send and lets the test
+// answer, indicate or cut the connections.
 #ifndef TOLK_TESTS_HIDL_FAKE_RADIO_SERVICE_H
 #define TOLK_TESTS_HIDL_FAKE_RADIO_SERVICE_H
 
@@ -12,7 +12,6 @@
 #include <condition_variable>
 #include <cstring>
 #include <filesystem>
-#include <functional>
 #include <mutex>
 #include <string>
 #include <thread>
@@ -32,7 +31,6 @@ public:
     // socketPath: host path of the instance's socket (TestRoot::at of the device path).
     explicit FakeRadioService(const std::string &socketPath) : path_(socketPath) {
         std::filesystem::create_directories(std::filesystem::path(path_).parent_path());
-        unlink(path_.c_str());
         listenFd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
         sockaddr_un addr{};
         addr.sun_family = AF_UNIX;
@@ -44,7 +42,6 @@ public:
         }
         acceptThread_ = std::thread([this] { acceptLoop(); });
     }
-
     ~FakeRadioService() {
         stop();
         dropConnections();
@@ -52,34 +49,26 @@ public:
     }
 
     bool ok() const { return listenFd_ >= 0 || stopped_; }
-
     // Stops accepting: the instance is gone for new getService calls.
     void stop() {
         if (stopped_) return;
         stopped_ = true;
         unlink(path_.c_str());
-        if (listenFd_ >= 0) shutdown(listenFd_, SHUT_RDWR);
-        if (acceptThread_.joinable()) acceptThread_.join();
-        if (listenFd_ >= 0) close(listenFd_);
-        listenFd_ = -1;
+        if (listenFd_ < 0) return;
+        shutdown(listenFd_, SHUT_RDWR);
+        acceptThread_.join();
+        close(listenFd_);
     }
-
     // Ends every client connection, as a dying service would.
     void dropConnections() {
         std::lock_guard<std::mutex> lock(mutex_);
-        for (int &fd : clients_) {
+        for (int fd : clients_) {
             if (fd >= 0) shutdown(fd, SHUT_RDWR);
         }
     }
-
-    bool waitFrames(size_t count, int timeoutMs = 3000) {
+    bool waitFrames(size_t count) {
         std::unique_lock<std::mutex> lock(mutex_);
-        return cv_.wait_for(lock, std::chrono::milliseconds(timeoutMs), [&] { return frames_.size() >= count; });
-    }
-    bool waitConnections(int count, int timeoutMs = 3000) {
-        std::unique_lock<std::mutex> lock(mutex_);
-        return cv_.wait_for(lock, std::chrono::milliseconds(timeoutMs),
-                            [&] { return static_cast<int>(clients_.size()) >= count; });
+        return cv_.wait_for(lock, std::chrono::seconds(3), [&] { return frames_.size() >= count; });
     }
     std::vector<FakeRadioFrame> frames() {
         std::lock_guard<std::mutex> lock(mutex_);
@@ -89,13 +78,12 @@ public:
         std::lock_guard<std::mutex> lock(mutex_);
         return static_cast<int>(clients_.size());
     }
-
     // Sends to the newest client connection; false when there is none.
-    bool send(uint32_t type, const std::string &payload, int32_t extra = 0) {
+    bool send(uint32_t type, const std::string &payload) {
         std::lock_guard<std::mutex> lock(mutex_);
         if (clients_.empty() || clients_.back() < 0) return false;
-        int fd = clients_.back();
-        return radio_wire_send(fd, type, -1, extra, payload.data(), static_cast<uint32_t>(payload.size())) == 0;
+        return radio_wire_send(clients_.back(), type, -1, 0, payload.data(), static_cast<uint32_t>(payload.size())) ==
+               0;
     }
     bool respond(const std::string &payload) { return send(RADIO_WIRE_RESPONSE, payload); }
     bool indicate(const std::string &payload) { return send(RADIO_WIRE_INDICATION, payload); }
@@ -104,29 +92,20 @@ private:
     void acceptLoop() {
         for (;;) {
             int fd = accept4(listenFd_, nullptr, nullptr, SOCK_CLOEXEC);
-            if (fd < 0) {
-                if (errno == EINTR) continue;
-                return;
-            }
-            int index;
-            {
-                std::lock_guard<std::mutex> lock(mutex_);
-                index = static_cast<int>(clients_.size());
-                clients_.push_back(fd);
-                readers_.emplace_back([this, fd, index] { readLoop(fd, index); });
-            }
-            cv_.notify_all();
+            if (fd < 0 && errno == EINTR) continue;
+            if (fd < 0) return;
+            std::lock_guard<std::mutex> lock(mutex_);
+            int index = static_cast<int>(clients_.size());
+            clients_.push_back(fd);
+            readers_.emplace_back([this, fd, index] { readLoop(fd, index); });
         }
     }
-
     void readLoop(int fd, int index) {
         std::vector<char> buf(RADIO_WIRE_MAX_PAYLOAD);
         RadioWireHeader hdr;
         while (radio_wire_recv(fd, &hdr, buf.data(), buf.size()) == 0) {
-            {
-                std::lock_guard<std::mutex> lock(mutex_);
-                frames_.push_back(FakeRadioFrame{hdr.type, hdr.serial, std::string(buf.data(), hdr.length), index});
-            }
+            std::lock_guard<std::mutex> lock(mutex_);
+            frames_.push_back(FakeRadioFrame{hdr.type, hdr.serial, std::string(buf.data(), hdr.length), index});
             cv_.notify_all();
         }
         std::lock_guard<std::mutex> lock(mutex_);
