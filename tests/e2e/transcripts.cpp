@@ -111,7 +111,8 @@ bool splitWords(const std::string &s, std::vector<std::string> *out) {
 
 bool parseStmt(const std::string &line, Stmt *st) {
     static const std::regex caseRe("(serial|adb|both)((?:\\s*\\((?:nocr|new|timeout \\d+)\\))*)\\s*(.*?)\\s*=>\\s*(.*?)"),
-        journalRe("journal\\s+(\\S+)(\\s+later)?:\\s*(.*?)"), propRe("prop\\s+(\\S+)\\s*=\\s*(.*?)"),
+        journalRe("journal\\s+(\\S+)(\\s+later)?:\\s*(.*?)"), propRe("(prop|tty)\\s+(\\S+)\\s*=\\s*(.*?)"),
+        radioRe("radio\\s+([1-4])(\\s+later)?:\\s*(.*?)(?:\\s+\\((refused: .*)\\))?"),
         fileRe("file\\s+(\\S+)\\s*(?:=\\s*(.*?)|(absent))"), otherRe("(log|quiet|setprop|write|sim)\\s+(\\S+)\\s*(.*?)");
     std::smatch m;
     Pattern p;
@@ -130,9 +131,16 @@ bool parseStmt(const std::string &line, Stmt *st) {
         st->a = m[1];
         return decode(m[3], 2, &st->want);
     }
+    // The radio journal's lines are SERIAL<TAB>REQUEST[<TAB>refused: WHY]; tolkd sends serial -1.
+    if (std::regex_match(line, m, radioRe)) {
+        st->verb = m[3] == "(end)" ? "journal-end" : m[2].matched ? "journal-later" : "journal";
+        st->a = "radio.slot" + m[1].str() + ".log";
+        std::string text = m[3] == "(end)" ? "(end)" : "-1\t" + m[3].str() + (m[4].matched ? "\t" + m[4].str() : "");
+        return decode(text, 2, &st->want);
+    }
     if (std::regex_match(line, m, propRe)) {
-        st->verb = "prop", st->a = m[1];
-        return decode(m[2], 0, &st->want);
+        st->verb = m[1], st->a = m[2];
+        return decode(m[3], 0, &st->want);
     }
     if (std::regex_match(line, m, fileRe)) {
         st->verb = m[3].matched ? "file-absent" : "file", st->a = m[1];
@@ -286,19 +294,29 @@ private:
         if (st.verb == "serial" || st.verb == "adb") {
             exchange(dev, st);
         } else if (st.verb.compare(0, 7, "journal") == 0) {
-            // No wait: a peer writes its line before it answers.
-            std::string text = d.readFile("/journal/" + st.a);
+            // A peer writes its line before it answers, but a line written after
+            // the answer (feedback to the framework) may still be on its way.
             size_t &off = dev.journalOffset[st.a];
-            bool found = false;
-            for (size_t nl; !found && off <= text.size() && (nl = text.find('\n', off)) != std::string::npos;) {
-                got = text.substr(off, nl - off), off = nl + 1;
-                found = compare(st.want, got) == 1;
-                if (st.verb != "journal-later") break;
-            }
+            bool found = false, taken = false;
+            waitFor(st.verb == "journal-end" ? 0 : kTimeoutMs, [&] {
+                std::string text = d.readFile("/journal/" + st.a);
+                for (size_t nl; !found && off <= text.size() && (nl = text.find('\n', off)) != std::string::npos;) {
+                    got = text.substr(off, nl - off), off = nl + 1, taken = true;
+                    found = compare(st.want, got) == 1;
+                    if (st.verb != "journal-later") break;
+                }
+                return found || (taken && st.verb == "journal");
+            });
             if (st.verb == "journal-end" ? !got.empty() : !found)
                 fail(st.line, st.text + "\n  got: " + (got.empty() ? "(no new line)" : got));
-        } else if (st.verb == "prop") {
-            if (!waitFor(kTimeoutMs, [&] { return compare(st.want, got = d.getprop(st.a)) == 1; }))
+        } else if (st.verb == "prop" || st.verb == "tty") {
+            auto value = [&] {
+                if (st.verb == "prop") return d.getprop(st.a);
+                std::string all = "\n" + d.sim({"tty-settings"});
+                size_t at = all.find("\n" + st.a + "=");
+                return at == std::string::npos ? "(none)" : all.substr(at + st.a.size() + 2, all.find('\n', at + 1) - at - st.a.size() - 2);
+            };
+            if (!waitFor(kTimeoutMs, [&] { return compare(st.want, got = value()) == 1; }))
                 fail(st.line, st.text + "\n  got: " + sim::visibleBytes(got));
         } else if (st.verb == "file" || st.verb == "file-absent") {
             bool absent = st.verb == "file-absent";
