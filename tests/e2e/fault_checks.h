@@ -1,12 +1,15 @@
-// Checks shared by the fault and soak tests: after whatever was done to it, the
-// daemon still runs, answers a local command on both host links and holds no
-// more descriptors than before.
+// Checks shared by the fault, soak and host program tests: a host link held
+// open across commands, and after whatever was done to the device, the daemon
+// still runs, answers a local command on both host links and holds no more
+// descriptors than before.
 #ifndef TOLK_TESTS_E2E_FAULT_CHECKS_H
 #define TOLK_TESTS_E2E_FAULT_CHECKS_H
 
 #include <dirent.h>
+#include <poll.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <fstream>
 #include <string>
 
@@ -19,6 +22,54 @@ namespace fault_checks {
 // What a local query answers on a link whose echo is off (adb always).
 const char kCsdfAnswer[] = "\r\n+CSDF: 1,1\n\r\n\r\nOK\r\n";
 
+// One host link kept open; the serial one with its echo switched off.
+class HostLink {
+public:
+    HostLink(SimDevice &d, bool adb) : fd_(adb ? d.connectAdb() : d.openSerial()) {
+        EXPECT_GE(fd_, 0) << (adb ? "adb" : "serial") << " link";
+        if (!adb && fd_ >= 0) writeAll(fd_, "ATE0\r"), readUntil(fd_, "OK\r\n", 3000);
+    }
+    ~HostLink() {
+        if (fd_ >= 0) close(fd_);
+    }
+    HostLink(const HostLink &) = delete;
+    HostLink &operator=(const HostLink &) = delete;
+    int fd() const { return fd_; }
+    // Sends the line with its CR; what arrived once the bytes end in a final
+    // result line ("OK", "ERROR", "ERROR:No Modem"...), or after ms.
+    std::string ask(const std::string &line, int ms = 3000) {
+        writeAll(fd_, line + "\r");
+        return answer(ms);
+    }
+    std::string answer(int ms = 3000) {
+        using Clock = std::chrono::steady_clock;
+        std::string got;
+        for (auto end = Clock::now() + std::chrono::milliseconds(ms); !finished(got) && Clock::now() < end;) {
+            struct pollfd p = {fd_, POLLIN, 0};
+            char buf[4096];
+            int left = static_cast<int>(std::chrono::duration_cast<std::chrono::milliseconds>(end - Clock::now()).count());
+            ssize_t n = poll(&p, 1, left) == 1 ? read(fd_, buf, sizeof buf) : 0;
+            if (n <= 0) break;
+            got.append(buf, static_cast<size_t>(n));
+        }
+        return got;
+    }
+    // Sends the line; what arrived within ms (an answer that must not come).
+    std::string silent(const std::string &line, int ms = 200) {
+        writeAll(fd_, line + "\r");
+        return readQuiet(fd_, ms, ms);
+    }
+
+private:
+    static bool finished(const std::string &got) {
+        size_t cut = got.size() > 2 ? got.rfind("\r\n", got.size() - 3) : std::string::npos;
+        std::string last = cut == std::string::npos ? "" : got.substr(cut + 2);
+        return last == "OK\r\n" || last == "ERROR\r\n" || last.compare(0, 6, "ERROR:") == 0;
+    }
+    int fd_;
+};
+
+// Requests a peer received: lines of its journal holding line.
 inline int countOf(const std::string &text, const std::string &needle) {
     int n = 0;
     for (size_t pos = text.find(needle); pos != std::string::npos; pos = text.find(needle, pos + needle.size())) n++;

@@ -7,17 +7,15 @@
 #include <gtest/gtest.h>
 
 #include "fault_checks.h"
-#include "modem_e2e.h"
 
 using namespace fault_checks;
-using namespace modem_e2e;
 
 namespace {
 
 const std::string kNoModem = "\r\nERROR:No Modem\r\n";
 
 TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
-    SimDevice d(openModem());
+    SimDevice d({"--prop", "persist.service.tolk.usermode=1"});
     ASSERT_TRUE(d.started()) << d.upOutput();
     const std::string v91(91, '7');
 
