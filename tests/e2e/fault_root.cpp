@@ -14,9 +14,16 @@ namespace {
 
 const std::string kNoModem = "\r\nERROR:No Modem\r\n";
 
+// Still serving on the connection of the test, with the descriptors it had.
+void expectAnswering(SimDevice &d, HostLink &adb, int fds) {
+    EXPECT_EQ(visible(kCsdfAnswer), visible(adb.ask("AT+CSDF?")));
+    EXPECT_EQ(fds, settledFdCount(d, fds)) << tolkdFdList(d);
+}
+
 TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
     SimDevice d({"--prop", "persist.service.tolk.usermode=1"});
     ASSERT_TRUE(d.started()) << d.upOutput();
+    HostLink adb(d, true);
     const std::string v91(91, '7');
 
     // The SIM choice names a slot; anything else finds no modem, never a wrong slot.
@@ -44,29 +51,31 @@ TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
             SCOPED_TRACE(std::string("sim ") + c.sim + " cdma " + c.cdma);
             d.setprop("persist.service.tolk.sim", c.sim);
             d.setprop("persist.radio.cdma_slot", c.cdma);
-            EXPECT_EQ(visible(c.answer), visible(d.at("AT+CGSN", true, 3000)));
+            EXPECT_EQ(visible(c.answer), visible(adb.ask("AT+CGSN")));
         }
-        if (pass == 0) fds = baselineFds(d);
+        if (pass == 0) fds = stableFdCount(d);
     }
     d.setprop("persist.service.tolk.sim", v91);
-    EXPECT_EQ(visible(kNoModem), visible(d.at("AT+CGSN", true, 3000)));
+    EXPECT_EQ(visible(kNoModem), visible(adb.ask("AT+CGSN")));
     d.setprop("persist.service.tolk.sim", "0");
 
     // A switch holding a 91-character value or text is reported, not misread.
     d.setprop("persist.service.tolk_urc.enable", v91);
-    EXPECT_EQ("\r\n+EURC:invalid value.\r\n\r\nOK\r\n", d.at("AT%EURC?", true));
+    EXPECT_EQ("\r\n+EURC:invalid value.\r\n\r\nOK\r\n", adb.ask("AT%EURC?"));
     d.setprop("persist.service.tolk_urc.enable", "abc");
-    EXPECT_EQ("\r\n+EURC:0\r\n\r\nOK\r\n", d.at("AT%EURC?", true));
+    EXPECT_EQ("\r\n+EURC:0\r\n\r\nOK\r\n", adb.ask("AT%EURC?"));
     // The longest USB configuration is echoed whole.
     d.setprop("sys.usb.config", std::string(91, 'm'));
-    EXPECT_EQ("\r\n@USBCONFIG: \"" + std::string(91, 'm') + "\"\r\n\r\nOK\r\n\r\nOK\r\n", d.at("AT@USBCONFIG?", true));
-    expectServing(d, fds, "after the property cases");
+    EXPECT_EQ("\r\n@USBCONFIG: \"" + std::string(91, 'm') + "\"\r\n\r\nOK\r\n\r\nOK\r\n", adb.ask("AT@USBCONFIG?"));
+    expectAnswering(d, adb, fds);
 }
 
 TEST(FaultRoot, StoresAndDeviceFilesMissingOrMisshaped) {
     SimDevice d;
     ASSERT_TRUE(d.started()) << d.upOutput();
     int fds = baselineFds(d);
+    HostLink adb(d, true);
+    fds++;  // its connection
     const std::string root = d.root();
     const std::string store = root + "/nvram/PRODUCT_INFO";
 
@@ -84,14 +93,14 @@ TEST(FaultRoot, StoresAndDeviceFilesMissingOrMisshaped) {
         rmdir(store.c_str());
         if (std::string(c.what) == "short") d.writeFile("/nvram/PRODUCT_INFO", std::string(10, '\0'));
         if (std::string(c.what) == "folder") mkdir(store.c_str(), 0755);
-        EXPECT_EQ(visible(c.userAt), visible(d.at("AT*CIT_ReadUserAT", true)));
-        EXPECT_EQ("\r\nERROR\r\n", d.at("AT*CIT_WriteUserAT", true));
-        EXPECT_EQ(visible(c.userAt), visible(d.at("AT*CIT_ReadUserAT", true))) << "nothing was written";
+        EXPECT_EQ(visible(c.userAt), visible(adb.ask("AT*CIT_ReadUserAT")));
+        EXPECT_EQ("\r\nERROR\r\n", adb.ask("AT*CIT_WriteUserAT"));
+        EXPECT_EQ(visible(c.userAt), visible(adb.ask("AT*CIT_ReadUserAT"))) << "nothing was written";
     }
     rmdir(store.c_str());
     d.writeFile("/nvram/PRODUCT_INFO", std::string(1024, '\0'));
-    EXPECT_EQ("\r\nWriteUserAT Pass\r\nOK\r\n", d.at("AT*CIT_WriteUserAT", true));
-    EXPECT_EQ("\r\nUserAT =0\r\nOK\r\n", d.at("AT*CIT_ReadUserAT", true));
+    EXPECT_EQ("\r\nWriteUserAT Pass\r\nOK\r\n", adb.ask("AT*CIT_WriteUserAT"));
+    EXPECT_EQ("\r\nUserAT =0\r\nOK\r\n", adb.ask("AT*CIT_ReadUserAT"));
 
     // The CIT result file: a folder, too long, too short, unreadable.
     const std::string citf = root + "/data/prod/citf";
@@ -99,13 +108,13 @@ TEST(FaultRoot, StoresAndDeviceFilesMissingOrMisshaped) {
     mkdir((root + "/data/prod").c_str(), 0755);
     unlink(citf.c_str());
     mkdir(citf.c_str(), 0755);
-    EXPECT_EQ("\r\nOK\r\n", d.at("AT*CIT_GACITF", true));
-    EXPECT_EQ("\r\nERROR\r\n", d.at("AT*CIT_WCITF", true)) << "a result that cannot be stored is no success";
+    EXPECT_EQ("\r\nOK\r\n", adb.ask("AT*CIT_GACITF"));
+    EXPECT_EQ("\r\nERROR\r\n", adb.ask("AT*CIT_WCITF")) << "a result that cannot be stored is no success";
     rmdir(citf.c_str());
     d.writeFile("/data/prod/citf", std::string(100, 'Z'));
-    EXPECT_EQ("\r\n" + std::string(32, 'Z') + "\r\nOK\r\n", d.at("AT*CIT_GACITF", true));
+    EXPECT_EQ("\r\n" + std::string(32, 'Z') + "\r\nOK\r\n", adb.ask("AT*CIT_GACITF"));
     d.writeFile("/data/prod/citf", "ab");
-    EXPECT_EQ("\r\nOK\r\n", d.at("AT*CIT_WCITF", true));
+    EXPECT_EQ("\r\nOK\r\n", adb.ask("AT*CIT_WCITF"));
     EXPECT_EQ("x0000001", d.readFile("/data/prod/citf")) << "a short file is written whole";
 
     // The PMIC ADC device: missing, junk, extreme values, a folder.
@@ -126,12 +135,12 @@ TEST(FaultRoot, StoresAndDeviceFilesMissingOrMisshaped) {
         rmdir(adc.c_str());
         if (c.content && *c.content) d.writeFile("/dev/OV_pmic_adc_cali", c.content);
         if (c.content && !*c.content) mkdir(adc.c_str(), 0755);
-        EXPECT_EQ(visible(c.gcsf), visible(d.at("AT@GCSF", true)));
-        EXPECT_EQ(visible(c.gbv), visible(d.at("AT@GBV", true)));
+        EXPECT_EQ(visible(c.gcsf), visible(adb.ask("AT@GCSF")));
+        EXPECT_EQ(visible(c.gbv), visible(adb.ask("AT@GBV")));
     }
     rmdir(adc.c_str());
-    EXPECT_EQ("\r\n0\r\nOK\r\n", d.at("AT@SCC", true)) << "the charger switch without the device";
-    expectServing(d, fds, "after the file cases");
+    EXPECT_EQ("\r\n0\r\nOK\r\n", adb.ask("AT@SCC")) << "the charger switch without the device";
+    expectAnswering(d, adb, fds);
 }
 
 }  // namespace
