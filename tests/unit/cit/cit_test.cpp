@@ -1,0 +1,216 @@
+// The CIT commands: those the daemon answers itself (the product-information
+// record, the result file) and those passed to the test application, against an
+// in-test application on the abstract socket the daemon connects to.
+#include <gtest/gtest.h>
+
+#include <sys/socket.h>
+#include <unistd.h>
+
+#include <map>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <thread>
+
+#include <cutils/sockets.h>
+#include <tolk_platform/local_socket.h>
+
+#include "cit/cit_cmd.h"
+#include "cit/pro_info.h"
+#include "host_capture.h"
+#include "test_root.h"
+
+namespace {
+
+const char kStore[] = "/nvram/PRODUCT_INFO";
+
+// The test application: one word per NUL, answered by word ("OK" by default),
+// one connection at a time.
+class FakeTestApp {
+public:
+    FakeTestApp() : listen_(tolk_local_server(CIT_SOCKET_NAME, ANDROID_SOCKET_NAMESPACE_ABSTRACT, SOCK_STREAM, 4)) {
+        EXPECT_GE(listen_, 0);
+        thread_ = std::thread([this] {
+            for (int conn; (conn = accept(listen_, nullptr, nullptr)) >= 0;) serve(conn);
+        });
+    }
+    ~FakeTestApp() {
+        shutdown(listen_, SHUT_RDWR);
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            if (conn_ >= 0) shutdown(conn_, SHUT_RDWR);
+        }
+        thread_.join();
+        close(listen_);
+    }
+    void reply(const std::string &word, const std::string &text) {
+        std::lock_guard<std::mutex> lock(mutex_);
+        replies_[word] = text;
+    }
+
+private:
+    void serve(int conn) {
+        {
+            std::lock_guard<std::mutex> lock(mutex_);
+            conn_ = conn;
+        }
+        std::string pending;
+        char buf[256];
+        for (ssize_t n; (n = read(conn, buf, sizeof(buf))) > 0;) {
+            pending.append(buf, static_cast<size_t>(n));
+            for (size_t nul; (nul = pending.find('\0')) != std::string::npos; pending.erase(0, nul + 1)) {
+                std::lock_guard<std::mutex> lock(mutex_);
+                auto it = replies_.find(pending.substr(0, nul));
+                const std::string text = it == replies_.end() ? "OK" : it->second;
+                (void)!send(conn, text.data(), text.size(), MSG_NOSIGNAL);
+            }
+        }
+        std::lock_guard<std::mutex> lock(mutex_);
+        close(conn);
+        conn_ = -1;
+    }
+
+    int listen_;
+    int conn_ = -1;
+    std::thread thread_;
+    std::mutex mutex_;
+    std::map<std::string, std::string> replies_;
+};
+
+class CitTest : public ::testing::Test {
+protected:
+    void SetUp() override { sock_id = -1; }
+    void TearDown() override {
+        if (sock_id >= 0) close(sock_id);
+    }
+    // Runs a line; gives what the host received.
+    std::string ask(const std::string &line, int result = 0) {
+        std::string buf = line;
+        EXPECT_EQ(result, cit_test_pase(&buf[0])) << line;
+        return host_.take();
+    }
+
+    TestRoot root_;
+    HostCapture host_;
+};
+using CitLocal = CitTest;
+using CitForward = CitTest;
+
+std::string pattern(const std::string &head, size_t n) {
+    std::string s = head;
+    while (s.size() < n) s.push_back(static_cast<char>('a' + s.size() % 26));
+    return s.substr(0, n);
+}
+
+// The host bytes for a forwarded command's answer text and verdict.
+std::string framedVerdict(const std::string &text, bool ok) {
+    return (text.empty() ? "" : "\r\n" + text) + (ok ? "\r\nOK\r\n" : "\r\nERROR\r\n");
+}
+
+}  // namespace
+
+// Nothing may be read or written outside the 1024-byte record.
+TEST_F(CitLocal, ProInfoRefusesIndexesOutsideTheRecord) {
+    const std::string before(PRODUCT_INFO_SIZE, '\0');
+    root_.write(kStore, before);
+    for (const char *line : {"AT*CIT_READPROINFO=1024", "AT*CIT_READPROINFO=-1", "AT*CIT_READPROINFO",
+                             "AT*CIT_READPROINFO=99999999999999999999", "AT*CIT_WRITEPROINFO=1024,1",
+                             "AT*CIT_WRITEPROINFO=-5,1", "AT*CIT_WRITEPROINFO=4294967296,1"}) {
+        EXPECT_EQ("\r\nERROR\r\n", ask(line)) << line;
+    }
+    // Without both "=" and "," a write gets no answer at all.
+    EXPECT_EQ("", ask("AT*CIT_WRITEPROINFO 5,6"));
+    EXPECT_EQ(before, root_.read(kStore));
+}
+
+// The station records a pass for every OK: a flag that did not reach the store is
+// an error, a stored one is answered as always.
+TEST_F(CitLocal, FlagWritesAnswerOkOnlyWhenStored) {
+    EXPECT_EQ("\r\nERROR\r\n", ask("AT*CIT_WRITEPROINFO=202,1")) << "no store";
+    EXPECT_EQ("\r\nERROR\r\n", ask("AT*CIT_WRITEUSERAT"));
+    root_.write(kStore, std::string(PRODUCT_INFO_SIZE, '\x01'));
+    EXPECT_EQ("\r\nOK\r\n", ask("AT*CIT_WRITEPROINFO=202,0"));
+    EXPECT_EQ("\r\nWriteUserAT Pass\r\nOK\r\n", ask("AT*CIT_WRITEUSERAT"));
+    EXPECT_EQ(0, getFlag(202));
+    EXPECT_EQ(0, getFlag(FLAG_USER_AT));
+}
+
+TEST_F(CitLocal, ResultFileEdges) {
+    EXPECT_EQ("\r\nERROR\r\n", ask("AT*CIT_WCITF")) << "no folder: neither opened nor created";
+    // An existing file keeps its other characters; only character 7 changes.
+    root_.write(CIT_RESULT_FILE, "y1234560tail");
+    ask("AT*CIT_WCITF");
+    EXPECT_EQ("y1234561tail", root_.read(CIT_RESULT_FILE));
+    // A file too short to hold character 7 is written whole, never padded with NULs.
+    root_.write(CIT_RESULT_FILE, "x00");
+    ask("AT*CIT_WCITF");
+    EXPECT_EQ("x0000001", root_.read(CIT_RESULT_FILE));
+    // At most 32 characters of the first line are shown.
+    root_.write(CIT_RESULT_FILE, std::string(40, '7'));
+    EXPECT_EQ("\r\n" + std::string(32, '7') + "\r\nOK\r\n", ask("AT*CIT_GACITF"));
+}
+
+// The answer buffer holds 1024 bytes: a long answer is cut so that its final
+// result and terminator always fit, and the host always gets a whole final line.
+TEST_F(CitForward, LongAnswersAreCutSoTheFinalResultFits) {
+    FakeTestApp app;
+    const struct {
+        const char *line, *word;
+        std::string answer, shown;
+        bool ok;
+    } cases[] = {
+        {"AT*CIT_SN", "sn", pattern("Pass ", 1009), pattern("Pass ", 1009), true},
+        {"AT*CIT_SN", "sn", pattern("Pass ", 1010), pattern("Pass ", 1010), true},
+        {"AT*CIT_SN", "sn", pattern("Pass ", 1011), pattern("Pass ", 1010), true},
+        {"AT*CIT_SN", "sn", pattern("Pass ", 1024), pattern("Pass ", 1010), true},
+        {"AT*CIT_SN", "sn", pattern("Fail ", 1014), pattern("Fail ", 1014), false},
+        {"AT*CIT_SN", "sn", pattern("Fail ", 1015), pattern("Fail ", 1014), false},
+        {"AT*CIT_SN", "sn", pattern("Fail ", 1024), pattern("Fail ", 1014), false},
+        {"AT*CIT_KEY", "KEY", pattern("no key ", 1024), pattern("no key ", 1014), false},
+    };
+    for (const auto &c : cases) {
+        app.reply(c.word, c.answer);
+        EXPECT_EQ(framedVerdict(c.shown, c.ok), ask(c.line)) << c.answer.size() << " bytes answered";
+    }
+}
+
+// The link kept after an unmatched line is checked before it is used again: after
+// the application restarted, the command reaches the new one and is judged on its
+// answer, never on the empty answer of the dead link.
+TEST_F(CitForward, KeptLinkToARestartedApplicationIsNotReused) {
+    auto app = std::make_unique<FakeTestApp>();
+    EXPECT_EQ("\r\ntest_fail_no_case\r\nERROR\r\n\r\n", ask("AT*CIT_NOSUCH", -1));
+    ASSERT_GE(sock_id, 0) << "an unmatched line keeps the link";
+    app.reset();  // the application restarts: its link ends, a new one serves
+    app = std::make_unique<FakeTestApp>();
+    app->reply("sn", "SN0042");
+    EXPECT_EQ(framedVerdict("SN0042", true), ask("AT*CIT_SN"));
+}
+
+TEST(ProInfo, UnusableStoreGivesFallbacksAndIsNeverWritten) {
+    TestRoot root;
+    EXPECT_EQ(0, getFlag(FLAG_MMI1_RESULT)) << "no store";
+    EXPECT_EQ(-1, setFlag(FLAG_MMI1_RESULT, 1));
+    EXPECT_FALSE(root.exists(kStore));
+    // Two records; then one record of the wrong size, declared through the shape file.
+    const std::string twoRecords(2 * PRODUCT_INFO_SIZE, '\x01');
+    root.write(kStore, twoRecords);
+    EXPECT_EQ(255, getFlag(FLAG_MMI1_RESULT));
+    EXPECT_EQ(-1, setFlag(FLAG_MMI1_RESULT, 0));
+    EXPECT_EQ(twoRecords, root.read(kStore));
+    root.write("/nvram/PRODUCT_INFO.shape", "2048 1");
+    EXPECT_EQ(255, getFlag(0));
+    EXPECT_EQ(-1, setFlag(0, 0));
+    EXPECT_EQ(twoRecords, root.read(kStore));
+}
+
+TEST(ProInfo, IndexesOutsideTheRecordAreRefused) {
+    TestRoot root;
+    const std::string r(PRODUCT_INFO_SIZE, '\x11');
+    root.write(kStore, r);
+    for (int index : {-1, PRODUCT_INFO_SIZE, PRODUCT_INFO_SIZE + 1, -2147483647 - 1, 2147483647}) {
+        EXPECT_EQ(255, getFlag(index)) << index;
+        setFlag(index, 0x22);
+    }
+    EXPECT_EQ(r, root.read(kStore));
+}

@@ -1,0 +1,254 @@
+// The command line reader, SMS text merging and the user-mode gate against real
+// descriptors in every slot the reader watches: a pseudo-terminal in the daemon's
+// canonical mode as the serial port, a socket pair as the accepted adb connection,
+// a listening AF_UNIX socket as the control socket, and a modem pair.
+#include <fcntl.h>
+#include <sys/ioctl.h>
+#include <sys/resource.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <termios.h>
+#include <unistd.h>
+
+#include <string>
+#include <thread>
+
+#include <cutils/properties.h>
+#include <gtest/gtest.h>
+
+#include "core/reader.h"
+#include "core/sms_merge.h"
+#include "host_capture.h"
+#include "targets/mmi_queue.h"
+#include "targets/target_conn.h"
+#include "test_root.h"
+
+namespace {
+
+// Writes s on fd once the reader has taken everything waiting at its end readerFd,
+// so that s arrives while the reader is in the middle of what came before.
+void writeWhenRead(int fd, int readerFd, std::string s) {
+    std::thread([fd, readerFd, s] {
+        int pending = 1;
+        while (ioctl(readerFd, FIONREAD, &pending) == 0 && pending > 0) usleep(200);
+        if (write(fd, s.data(), s.size()) < 0) ADD_FAILURE();
+    }).detach();
+}
+
+class HostLinks : public ::testing::Test {
+protected:
+    TestRoot root;
+    int master = -1;  // host side of the serial port
+    int adbHost = -1;
+    int rildPeer = -1;
+    sockaddr_un listenAddr = {};
+
+    void SetUp() override {
+        alarm(30);  // a reader that waits forever fails the run instead of hanging it
+        memset(&gSerialDevice, 0, sizeof(gSerialDevice));
+        master = posix_openpt(O_RDWR | O_NOCTTY);
+        ASSERT_TRUE(master >= 0 && grantpt(master) == 0 && unlockpt(master) == 0);
+        // open() resolves paths under the device root in this binary; openat() does not.
+        int slave = openat(AT_FDCWD, ptsname(master), O_RDWR | O_NOCTTY);
+        struct termios t;
+        ASSERT_EQ(0, tcgetattr(slave, &t));
+        t.c_iflag = t.c_oflag = 0;
+        t.c_lflag = ICANON | IEXTEN;  // no echo; IEXTEN makes VEOL2 end a line
+        t.c_cc[VEOL] = 0x1A;
+        t.c_cc[VEOL2] = 0x1B;
+        tcsetattr(slave, TCSANOW, &t);
+        gSerialDevice.fd[DEVICE_SERIAL] = slave;
+
+        int sp[2];
+        ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM, 0, sp));
+        gSerialDevice.fd[DEVICE_ADB] = sp[0];
+        adbHost = sp[1];
+        listenAddr.sun_family = AF_UNIX;
+        snprintf(listenAddr.sun_path, sizeof(listenAddr.sun_path), "%s/adb", root.path().c_str());
+        int lfd = socket(AF_UNIX, SOCK_STREAM, 0);
+        ASSERT_EQ(0, bind(lfd, (sockaddr *)&listenAddr, sizeof(listenAddr)));
+        ASSERT_EQ(0, adb_socket_listen(lfd));
+        gSerialDevice.fd[DEVICE_ADB_LISTEN] = lfd;
+        ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM, 0, sp));
+        s_fdRild_command = sp[0];
+        rildPeer = sp[1];
+
+        isMsgCmdInput = isNeedMergeMsgCmdInput = false;
+        msgCmdMode = 0;
+        discardAdbLine();
+    }
+    void TearDown() override {
+        for (int &fd : gSerialDevice.fd) {
+            if (fd >= 0) close(fd);
+            fd = -1;
+        }
+        for (int fd : {master, adbHost, rildPeer, s_fdRild_command}) {
+            if (fd >= 0) close(fd);
+        }
+        s_fdRild_command = -1;
+        isMsgCmdInput = isNeedMergeMsgCmdInput = false;
+        alarm(0);
+    }
+    // One reading cycle: the line as routing gets it, "<null>" for none.
+    std::string nextLine() {
+        char *line = readline(&gSerialDevice);
+        return line == nullptr ? "<null>" : std::string(line);
+    }
+    // The same with its bytes as counted, NULs included.
+    std::string rawLine() {
+        char *line = readline(&gSerialDevice);
+        return line == nullptr ? "<null>" : std::string(line, gSerialDevice.cmdLen);
+    }
+};
+using ReaderTest = HostLinks;
+
+std::string mmitestLine(size_t len) {
+    std::string f = "at^mmitest=";
+    while (f.size() + 1 < len) f += (char)('A' + f.size() % 26);
+    return f + "\n";
+}
+
+}  // namespace
+
+TEST_F(ReaderTest, HalfAssembledAdbLineSurvivesASerialLine) {
+    writeAll(adbHost, "AT+CS");
+    writeWhenRead(master, gSerialDevice.fd[DEVICE_ADB], "AT+S\n");
+    EXPECT_EQ("AT+S", nextLine());
+    writeAll(adbHost, "Q\r");
+    EXPECT_EQ("AT+CSQ", nextLine());
+    EXPECT_EQ(DEVICE_ADB, gSerialDevice.currDevice);
+}
+
+TEST_F(ReaderTest, MmitestFrameRepair) {
+    // 49 bytes that lost 0x00 0xA8 at offset 12: put back without any further read.
+    std::string frame = mmitestLine(49);
+    writeAll(master, frame + "AT\n");
+    EXPECT_EQ(frame.substr(0, 12) + std::string("\0\xA8", 2) + frame.substr(12), rawLine());
+    EXPECT_EQ("AT", nextLine());
+
+    // A short piece waits (briefly) for exactly the missing rest.
+    std::string piece = mmitestLine(20), rest = std::string(28, 'z') + "\n";
+    writeAll(master, piece);
+    writeWhenRead(master, gSerialDevice.fd[DEVICE_SERIAL], rest + "AT\n");
+    EXPECT_EQ(piece.substr(0, 12) + std::string("\0\xA8", 2) + piece.substr(12) + rest, rawLine());
+    EXPECT_EQ("AT", nextLine());
+
+    // A longer line is no damaged frame: untouched, and the next line is not taken.
+    std::string longLine = mmitestLine(60);
+    writeAll(master, longLine + "AT\n");
+    EXPECT_EQ(longLine, rawLine());
+    EXPECT_EQ("AT", nextLine());
+}
+
+// A raw frame is no typed text: a 0x08 inside it edits only the text before its
+// first NUL, and the frame keeps its length and every byte from that NUL on.
+TEST_F(ReaderTest, BackspaceInARawFrameLeavesTheFrameWhole) {
+    std::string frame = std::string("at^mmitest=\b\0\xA8", 14);
+    while (frame.size() < 50) frame += (char)('C' + frame.size() % 20);
+    frame += "\n";
+    writeAll(master, frame);
+    EXPECT_EQ(std::string("at^mmitest\0\b\0\xA8", 14) + frame.substr(14), rawLine());
+
+    writeAll(adbHost, "AT+CX\bSQ\r");  // text still shortens
+    EXPECT_EQ("AT+CSQ", nextLine());
+    EXPECT_EQ(7, gSerialDevice.cmdLen);
+}
+
+// A short frame on adb whose rest never comes does not hold up the links, and
+// what the repair read past the frame's line end is the station's next lines.
+TEST_F(ReaderTest, ShortFrameOnAdbWaitsBriefAndKeepsTheNextLines) {
+    writeAll(adbHost, "at^mmitest=AB\r");
+    writeWhenRead(adbHost, gSerialDevice.fd[DEVICE_ADB], "AT+CSQ\rAT\r");
+    EXPECT_EQ(std::string("at^mmitest=A\0\xA8" "B\r", 16), rawLine());
+    EXPECT_EQ("AT+CSQ", nextLine());
+    EXPECT_EQ("AT", nextLine());
+    EXPECT_EQ(DEVICE_ADB, gSerialDevice.currDevice);
+}
+
+// A connection the listener cannot accept (descriptor table full) costs the
+// connected station neither its connection nor its half-typed line.
+TEST_F(ReaderTest, FailedAcceptKeepsTheLiveAdbConnection) {
+    writeAll(adbHost, "AT+CS");
+    int client = socket(AF_UNIX, SOCK_STREAM, 0);
+    ASSERT_EQ(0, connect(client, (sockaddr *)&listenAddr, sizeof(listenAddr)));
+    struct rlimit saved;
+    ASSERT_EQ(0, getrlimit(RLIMIT_NOFILE, &saved));
+    int lowest = dup(0);
+    close(lowest);
+    struct rlimit full = saved;
+    full.rlim_cur = lowest;
+    ASSERT_EQ(0, setrlimit(RLIMIT_NOFILE, &full));
+    writeWhenRead(adbHost, gSerialDevice.fd[DEVICE_ADB], "Q\r");
+    std::string line = nextLine();
+    setrlimit(RLIMIT_NOFILE, &saved);
+    close(client);
+    EXPECT_EQ("AT+CSQ", line);
+    EXPECT_EQ(DEVICE_ADB, gSerialDevice.currDevice);
+}
+
+// Merged SMS text: the held command, its text lines and the one line that goes
+// to the modem instead.
+class SmsMergeTest : public HostLinks {
+protected:
+    // Holds cmd in cmdBuf as routing leaves it and tries to start merging.
+    bool startMerge(const std::string &cmd) {
+        memset(gSerialDevice.cmdBuf, 0, sizeof(gSerialDevice.cmdBuf));
+        memcpy(gSerialDevice.cmdBuf, cmd.data(), cmd.size());
+        gSerialDevice.currDevice = DEVICE_SERIAL;
+        isNeedMergeMsgCmdInput = startMergeMsgCmdInputIfNeed(&gSerialDevice, gSerialDevice.cmdBuf) != 0;
+        return isNeedMergeMsgCmdInput;
+    }
+    std::string textLine(const std::string &text) {
+        static char lineBuf[DATA_BUF_SIZE];
+        memset(lineBuf, 0, sizeof(lineBuf));
+        memcpy(lineBuf, text.data(), text.size());
+        return handleMsgTextLine(&gSerialDevice, lineBuf, (int)text.size());
+    }
+};
+
+TEST_F(SmsMergeTest, TextLinesAreCollectedUntilCtrlZOrEsc) {
+    msgCmdMode = 1;
+    ASSERT_TRUE(startMerge("AT+CMGW=\"555\""));
+    EXPECT_EQ("\r\n> \r\n", drainFd(master));
+    EXPECT_EQ("AT+CMGW=\"555\",,\"ac\n", textLine("ab\bc\n"));  // backspaces applied
+    routeMsgTextLine(&gSerialDevice);  // unfinished: one prompt, nothing to the modem
+    EXPECT_EQ("\r\n> \r\n", drainFd(master));
+    EXPECT_EQ("AT+EMGW=\"555\",,\"ac\nd\"\r\n", textLine("d\x1B"));
+
+    // On adb the CR is the last byte, so the Ctrl-Z stays inside the text.
+    ASSERT_TRUE(startMerge("AT+CMGS=\"1\""));
+    EXPECT_EQ("AT+EMGS=\"1\",,\"hi\x1A\"\r\n", textLine("hi\x1A\r"));
+}
+
+TEST_F(SmsMergeTest, MergedCommandNeverOutgrowsTheBuffer) {
+    std::string fits(6000, 'a');
+    ASSERT_TRUE(startMerge("AT+CMGS=23"));
+    textLine(fits + "\n");
+    textLine(std::string(200, 'b') + "\n");  // would overflow: left out
+    EXPECT_EQ("AT+EMGS=23,\"" + fits + "\nend\"\r\n", textLine("end\x1A"));
+    // A held command with no room for suffix and closing is relayed instead.
+    EXPECT_FALSE(startMerge("AT+CMGS=" + std::string(6136, '1')));
+}
+
+// The user-mode gate in front of the modem. No radio service runs under the test
+// root, so a line that reaches the modem is answered "ERROR:No Modem" by the
+// bridge: that is how this test sees it arrive.
+using UserModeGateTest = HostLinks;
+
+TEST_F(UserModeGateTest, RefusedMmiCommandLeavesNoTextForTheNextCommand) {
+    auto route = [&](const char *text) {
+        snprintf(gSerialDevice.cmdBuf, sizeof(gSerialDevice.cmdBuf), "%s", text);
+        gSerialDevice.currDevice = DEVICE_SERIAL;
+        routeCommandLine(&gSerialDevice, gSerialDevice.cmdBuf);
+        return drainFd(master);
+    };
+    mmiCmdSeqReset();
+    property_set("ro.build.type", "user");
+    EXPECT_EQ("\r\nNot access to modem in User Mode.\r\n", route("AT+CPIN=1234"));
+    EXPECT_EQ(0, gMmiCmdSeq.cusMmiCmdPending);
+    EXPECT_EQ(0, gMmiCmdSeq.EIdx);
+    EXPECT_STREQ("", gMmiCmdSeq.cmd[0]);
+    // The next modem command that passes is an ordinary one and gets no queue entry.
+    EXPECT_EQ("\r\nERROR:No Modem\r\n", route("AT"));
+    EXPECT_EQ(-1, gMmiCmdSeq.seq[0]);
+}
