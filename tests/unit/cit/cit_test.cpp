@@ -35,11 +35,12 @@ public:
         });
     }
     ~FakeTestApp() {
-        shutdown(listen_, SHUT_RDWR);
         {
             std::lock_guard<std::mutex> lock(mutex_);
+            stopping_ = true;
             if (conn_ >= 0) shutdown(conn_, SHUT_RDWR);
         }
+        shutdown(listen_, SHUT_RDWR);
         thread_.join();
         close(listen_);
     }
@@ -53,6 +54,7 @@ private:
         {
             std::lock_guard<std::mutex> lock(mutex_);
             conn_ = conn;
+            if (stopping_) shutdown(conn, SHUT_RDWR);  // accepted while going away
         }
         std::string pending;
         char buf[256];
@@ -72,6 +74,7 @@ private:
 
     int listen_;
     int conn_ = -1;
+    bool stopping_ = false;
     std::thread thread_;
     std::mutex mutex_;
     std::map<std::string, std::string> replies_;
