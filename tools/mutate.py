@@ -626,7 +626,9 @@ def summarize(results, out=sys.stdout):
     if survived:
         out.write("survivors:\n")
         for r in survived:
-            out.write("  %s:%d  [%s] %s  %s  %s\n" % (r["file"], r["line"], r["kind"], r["orig"], ARROW, r["repl"]))
+            out.write("  %s:%d:%s  [%s] %s %s %s" % (r["file"], r["line"], r.get("col", "?"), r["kind"], r["orig"],
+                                                    ARROW, r["repl"]))
+            out.write("   in: %s\n" % r["context"] if r.get("context") else "\n")
     for r in invalid + missing:
         out.write("  %s: %s\n" % (r["status"], r["spec"]))
 
@@ -681,7 +683,8 @@ def run_mutants(args, ws):
     for i, site in enumerate(sites, 1):
         spec = site_spec(site)
         rec = {"type": "mutant", "n": i, "spec": spec, "file": site["file"], "line": site["line"],
-               "kind": site["kind"], "orig": site["orig"], "repl": site["repl"]}
+               "col": site["col"], "kind": site["kind"], "orig": site["orig"], "repl": site["repl"],
+               "context": site["context"]}
         t0 = time.time()
         original = apply(ws, site)
         if original is None:
@@ -689,7 +692,7 @@ def run_mutants(args, ws):
             log("%2d/%d missing   %s" % (i, len(sites), spec))
             emit(rec)
             continue
-        rec["line"] = site["line"]
+        rec["line"], rec["col"] = site["line"], site["col"]  # where it was found in this commit
         try:
             ok, out = ws.rebuild(timeout=args.timeout)
             rec["build_s"] = round(time.time() - t0, 1)
