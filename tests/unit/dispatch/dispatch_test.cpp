@@ -56,6 +56,10 @@ TEST_F(DispatcherTest, PctModeAndVzwTolkCfgMoveCommandsBetweenModemAndFramework)
 }
 
 TEST_F(DispatcherTest, MmiTextSlotsWrapAndStayInStepWhenTheQueueIsFull) {
+    gMmiCmdSeq.EIdx = MMI_QUEUE_SIZE;  // a damaged index takes no slot at all
+    EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CPIN=1"));
+    EXPECT_EQ(MMI_QUEUE_SIZE, gMmiCmdSeq.EIdx);
+    gMmiCmdSeq.cusMmiCmdPending = 0;
     gMmiCmdSeq.EIdx = 9;
     gMmiCmdSeq.enSeqIdx = 9;
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CPIN=1"));

@@ -1,0 +1,248 @@
+// The serial link: the port's terminal settings on a real pseudo-terminal (open,
+// the echo switch, the MMI test option), the text writer's framing and numeric
+// codes, and the raw audio writer's fatal errors. What the port and the writers
+// do around whole commands is checked end to end (audio, links and SMS tables).
+#include <gtest/gtest.h>
+
+#include <fcntl.h>
+#include <poll.h>
+#include <signal.h>
+#include <stdlib.h>
+#include <string.h>
+#include <sys/socket.h>
+#include <termios.h>
+#include <unistd.h>
+
+#include <string>
+#include <vector>
+
+#include "host_capture.h"
+#include "serial/response_writer.h"
+#include "serial/serial_device.h"
+
+namespace {
+
+struct termios settingsOf(int fd) {
+    struct termios t = {};
+    EXPECT_EQ(0, tcgetattr(fd, &t));
+    return t;
+}
+
+bool sameSettings(const struct termios &a, const struct termios &b) {
+    return a.c_iflag == b.c_iflag && a.c_oflag == b.c_oflag && a.c_cflag == b.c_cflag && a.c_lflag == b.c_lflag &&
+           memcmp(a.c_cc, b.c_cc, sizeof(a.c_cc)) == 0;
+}
+
+// A freshly reset record per test, a pseudo-terminal standing in for the port, no
+// device root (so that its path opens as it is), descriptors closed afterwards.
+class SerialTest : public ::testing::Test {
+protected:
+    void SetUp() override {
+        if (const char *root = getenv("TOLKD_ROOT")) savedRoot_ = root;
+        unsetenv("TOLKD_ROOT");
+        reset();
+        master_ = posix_openpt(O_RDWR | O_NOCTTY);
+        ASSERT_TRUE(master_ >= 0 && grantpt(master_) == 0 && unlockpt(master_) == 0);
+        slavePath_ = ptsname(master_);
+    }
+    void TearDown() override {
+        for (int fd : gSerialDevice.fd) {
+            if (fd >= 0) close(fd);
+        }
+        for (int fd : owned_) close(fd);
+        close(master_);
+        reset();
+        if (!savedRoot_.empty()) setenv("TOLKD_ROOT", savedRoot_.c_str(), 1);
+    }
+    static void reset() {
+        initSerialDevice(&gSerialDevice);
+        memset(&last_deviceOptions, 0, sizeof(last_deviceOptions));
+        gNumericMode = false;
+    }
+    // Opens the pty slave as the serial port that supplied the current line.
+    int openPort() {
+        int fd = open_serial_device(&gSerialDevice, slavePath_.c_str());
+        EXPECT_GE(fd, 0);
+        return gSerialDevice.fd[DEVICE_SERIAL] = fd;
+    }
+    // A socket pair as device's link and the current one; returns the host end.
+    int link(int device, int type = SOCK_STREAM) {
+        int sv[2];
+        EXPECT_EQ(0, socketpair(AF_UNIX, type, 0, sv));
+        gSerialDevice.fd[device] = sv[0];
+        gSerialDevice.currDevice = device;
+        owned_.push_back(sv[1]);
+        return sv[1];
+    }
+
+    int master_ = -1;
+    std::string slavePath_, savedRoot_;
+    std::vector<int> owned_;
+};
+using SerialDeviceTest = SerialTest;
+using AudioWriterTest = SerialTest;
+
+// The text writer to a SOCK_SEQPACKET host end, so that every write() of the
+// writer arrives as one record: an answer must take exactly one.
+class ResponseWriterTest : public SerialTest {
+protected:
+    void SetUp() override {
+        SerialTest::SetUp();
+        host_ = link(DEVICE_SERIAL, SOCK_SEQPACKET);
+    }
+    std::string hostGets(const char *data, int len) {
+        writeDataToSerial(data, len);
+        std::vector<std::string> got;
+        static char buf[16384];
+        for (ssize_t n; (n = recv(host_, buf, sizeof(buf), MSG_DONTWAIT)) > 0;) got.emplace_back(buf, n);
+        EXPECT_EQ(1u, got.size());
+        return got.empty() ? "<nothing>" : got[0];
+    }
+    std::string hostGets(const std::string &data) { return hostGets(data.data(), static_cast<int>(data.size())); }
+    int host_ = -1;
+};
+
+}  // namespace
+
+// Ctrl-D from the host is a byte like any other: were it the terminal's end-of-file
+// character, the read would return 0 at a line start, which the reader takes for a
+// dead port (close, reopen, queued input flushed), and would cut a line short.
+TEST_F(SerialDeviceTest, ControlDIsDataNotEndOfFile) {
+    const int fd = openPort();
+    ASSERT_GE(fd, 0);
+    EXPECT_EQ(0, fcntl(fd, F_GETFL) & O_NONBLOCK) << "later I/O must block";
+    writeAll(master_, "\x04" "AT\n");
+    char buf[64];
+    struct pollfd p = {fd, POLLIN, 0};
+    ASSERT_EQ(1, poll(&p, 1, 500));
+    EXPECT_EQ(4, read(fd, buf, sizeof(buf))) << "a Ctrl-D at a line start must not read as end of file";
+    writeAll(master_, "AT+CSQ\x04\n");
+    EXPECT_EQ("AT+CSQ\x04\n", drainFd(fd)) << "nor end a line before its delimiter";
+    // A NUL byte stays ordinary too, with end-of-file switched off.
+    writeAll(master_, std::string("A\0T\n", 4));
+    EXPECT_EQ(std::string("A\0T\n", 4), drainFd(fd));
+    EXPECT_EQ(-1, open_serial_device(&gSerialDevice, "/nonexistent/ttyX"));
+    EXPECT_EQ(-1, open_serial_device(&gSerialDevice, nullptr));
+}
+
+TEST_F(SerialDeviceTest, EchoSwitchKeepsSmsLineEnds) {
+    const int fd = openPort();
+    ASSERT_GE(fd, 0);
+    const struct termios opened = settingsOf(fd);
+    EXPECT_EQ(0, setEchoOption(0));
+    EXPECT_EQ(0, gSerialDevice.echoOption[DEVICE_SERIAL]);
+    struct termios t = settingsOf(fd);
+    EXPECT_EQ(static_cast<tcflag_t>(ICANON | IEXTEN), t.c_lflag);
+    EXPECT_EQ(opened.c_oflag, t.c_oflag);
+    EXPECT_EQ(opened.c_iflag, t.c_iflag);
+
+    // After ATE0 an SMS body ended by Ctrl-Z, or cancelled with ESC, without newline,
+    // still reaches the reader with that character last.
+    writeAll(master_, "hello\x1a");
+    EXPECT_EQ("hello\x1a", drainFd(fd));
+    writeAll(master_, "bye\x1b");
+    EXPECT_EQ("bye\x1b", drainFd(fd));
+    writeAll(master_, "AT+");
+    EXPECT_EQ("", drainFd(fd, 100));
+
+    EXPECT_EQ(0, setEchoOption(1));
+    EXPECT_EQ(static_cast<tcflag_t>(ICANON | ECHO | IEXTEN), settingsOf(fd).c_lflag);
+    // On the adb socket the setting is recorded although no terminal takes it.
+    link(DEVICE_ADB);
+    EXPECT_EQ(-1, setEchoOption(1));
+    EXPECT_EQ(1, gSerialDevice.echoOption[DEVICE_ADB]);
+}
+
+TEST_F(SerialDeviceTest, RestoreWithoutEnableLeavesPortAlone) {
+    const int fd = openPort();
+    ASSERT_GE(fd, 0);
+    const struct termios opened = settingsOf(fd);
+    // Nothing was saved: an empty record would switch off the receiver and speed.
+    setMMITESTOption(0);
+    EXPECT_TRUE(sameSettings(opened, settingsOf(fd)));
+}
+
+TEST_F(ResponseWriterTest, FramesAnswersOnce) {
+    const std::pair<std::string, std::string> cases[] = {
+        {"\r\nOK\r\n", "\r\nOK\r\n"},
+        {"OK", "\r\nOK\r\n"},
+        {"\r\n", "\r\n\r\n"},
+        {"\r\n+CSQ: 20,99\r\n\r\nOK\r\n", "\r\n+CSQ: 20,99\r\n\r\nOK\r\n"},
+        {"\r\n\r\nX\r\n\r\n", "\r\n\r\nX\r\n\r\n"},  // one CR LF off each end only
+        {"X\r\n", "\r\nX\r\n"},
+        {"\n\r", "\r\n\n\r\r\n"},
+        // A counted NUL defeats the tail test; text ends at its first NUL.
+        {std::string("ERROR:No Modem", 15), "\r\nERROR:No Modem\r\n"},
+        {std::string("\r\n> ", 5), "\r\n> \r\n"},
+        {std::string("AB\0CD\r\n", 7), "\r\nAB\r\n"},
+        {"", "\r\n\r\n"},
+        // Audio answers pass raw; their prefixes count within the length only, and case-exactly.
+        {std::string("AUD+VOL\r\n\0\x01", 11), std::string("AUD+VOL\r\n\0\x01", 11)},
+        {std::string("mm\0\r\nOK\r\n", 9), std::string("mm\0\r\nOK\r\n", 9)},
+        {"Mm", "\r\nMm\r\n"},
+    };
+    for (const auto &c : cases) EXPECT_EQ(c.second, hostGets(c.first)) << c.first;
+    EXPECT_EQ("\r\nAU\r\n", hostGets("AUD", 2));
+    EXPECT_EQ("\r\n\r\n", hostGets(nullptr, 12));
+    EXPECT_EQ("\r\n\r\n", hostGets("OK", -3));
+    EXPECT_EQ("\r\nO\r\n", hostGets("OK", 1));
+    // Beyond one full data buffer only the first 6145 bytes are looked at.
+    std::string big = "\r\n" + std::string(8000, 'A');
+    EXPECT_EQ("\r\n" + std::string(DATA_BUF_SIZE - 2, 'A') + "\r\n", hostGets(big));
+}
+
+TEST_F(ResponseWriterTest, NumericMode) {
+    gNumericMode = true;
+    const char *verbose[] = {"OK", "CONNECT", "RING", "NO CARRIER", "ERROR", "NO DIALTONE", "BUSY", "NO ANSWER"};
+    const char digits[] = "01234678";  // there is no code 5
+    for (size_t i = 0; i < 8; i++) {
+        EXPECT_EQ(std::string("\r\n") + digits[i] + "\r\n", hostGets(verbose[i])) << verbose[i];
+        EXPECT_EQ(std::string("\r\n") + digits[i] + "\r\n", hostGets(std::string("\r\n") + verbose[i] + "\r\n"));
+    }
+    // Only a body that is exactly a table text is converted; audio answers stay raw.
+    for (const char *same : {"ok", "OK ", "CONNECT 9600", "+CSQ: 20,99\r\n\r\nOK"}) {
+        EXPECT_EQ(std::string("\r\n") + same + "\r\n", hostGets(same));
+    }
+    EXPECT_EQ("aud", hostGets("aud"));
+}
+
+// A broken or closed adb connection is dropped, never waited on.
+TEST_F(AudioWriterTest, FatalErrorOnAdbDropsConnection) {
+    struct sigaction ignore = {}, old = {};
+    ignore.sa_handler = SIG_IGN;
+    ASSERT_EQ(0, sigaction(SIGPIPE, &ignore, &old));
+    close(link(DEVICE_ADB));
+    owned_.pop_back();
+    const int fd = gSerialDevice.fd[DEVICE_ADB];
+    writeDataToSerialByAudioType("AUD+X", 5);
+    EXPECT_EQ(-1, gSerialDevice.fd[DEVICE_ADB]);
+    EXPECT_EQ(-1, fcntl(fd, F_GETFD)) << "the broken connection must be closed";
+    sigaction(SIGPIPE, &old, nullptr);
+
+    gSerialDevice.fd[DEVICE_ADB] = fd;  // no longer open: select reports EBADF
+    writeDataToSerialByAudioType("AUD+X", 5);
+    EXPECT_EQ(-1, gSerialDevice.fd[DEVICE_ADB]);
+}
+
+TEST_F(AudioWriterTest, FatalErrorOnSerialReopensInMmiTestSet) {
+    snprintf(gSerialDevice.devName[DEVICE_SERIAL], sizeof(gSerialDevice.devName[0]), "%s", slavePath_.c_str());
+    // A descriptor that cannot be written: the write fails with EBADF.
+    gSerialDevice.fd[DEVICE_SERIAL] = open("/dev/null", O_RDONLY);
+    const std::string frame("\x10\0\r\n\x1a\x1b\r", 7);
+    writeDataToSerialByAudioType(frame.data(), 7);
+    const int reopened = gSerialDevice.fd[DEVICE_SERIAL];
+    ASSERT_GE(reopened, 0);
+    EXPECT_EQ(frame, drainFd(master_));
+    struct termios t = settingsOf(reopened);
+    EXPECT_EQ(0u, t.c_iflag);
+    EXPECT_EQ(static_cast<tcflag_t>(ICANON), t.c_lflag);
+    // What a later restore brings back is the freshly opened port.
+    EXPECT_EQ(static_cast<tcflag_t>(ICANON | ECHO | IEXTEN), last_deviceOptions.c_lflag);
+
+    // A port that cannot be opened again ends the process.
+    GTEST_FLAG_SET(death_test_style, "threadsafe");
+    snprintf(gSerialDevice.devName[DEVICE_SERIAL], sizeof(gSerialDevice.devName[0]), "/nonexistent/ttyGS9");
+    close(reopened);
+    gSerialDevice.fd[DEVICE_SERIAL] = open("/dev/null", O_RDONLY);
+    EXPECT_EXIT(writeDataToSerialByAudioType("AUD", 3), ::testing::ExitedWithCode(1), "");
+}
