@@ -3,14 +3,13 @@
 // in-test application on the abstract socket the daemon connects to.
 #include <gtest/gtest.h>
 
+#include <signal.h>
 #include <sys/socket.h>
+#include <sys/wait.h>
 #include <unistd.h>
 
-#include <map>
 #include <memory>
-#include <mutex>
 #include <string>
-#include <thread>
 
 #include <cutils/sockets.h>
 #include <tolk_platform/local_socket.h>
@@ -24,60 +23,39 @@ namespace {
 
 const char kStore[] = "/nvram/PRODUCT_INFO";
 
-// The test application: one word per NUL, answered by word ("OK" by default),
-// one connection at a time.
-class FakeTestApp {
+// The test application in a child process, on the abstract socket the daemon
+// connects to: one word per NUL, answered with the file /app/WORD of the device
+// root ("OK" without one). Ending it ends its links, as a restart does.
+class TestApp {
 public:
-    FakeTestApp() : listen_(tolk_local_server(CIT_SOCKET_NAME, ANDROID_SOCKET_NAMESPACE_ABSTRACT, SOCK_STREAM, 4)) {
-        EXPECT_GE(listen_, 0);
-        thread_ = std::thread([this] {
-            for (int conn; (conn = accept(listen_, nullptr, nullptr)) >= 0;) serve(conn);
-        });
-    }
-    ~FakeTestApp() {
-        {
-            std::lock_guard<std::mutex> lock(mutex_);
-            stopping_ = true;
-            if (conn_ >= 0) shutdown(conn_, SHUT_RDWR);
+    explicit TestApp(const TestRoot &root) {
+        int listenFd = tolk_local_server(CIT_SOCKET_NAME, ANDROID_SOCKET_NAMESPACE_ABSTRACT, SOCK_STREAM, 4);
+        EXPECT_GE(listenFd, 0);
+        pid_ = fork();
+        if (pid_ == 0) {
+            for (int conn; (conn = accept(listenFd, nullptr, nullptr)) >= 0; close(conn)) {
+                std::string pending;
+                char buf[256];
+                for (ssize_t n; (n = read(conn, buf, sizeof(buf))) > 0;) {
+                    pending.append(buf, static_cast<size_t>(n));
+                    for (size_t nul; (nul = pending.find('\0')) != std::string::npos; pending.erase(0, nul + 1)) {
+                        const std::string word = "/app/" + pending.substr(0, nul);
+                        const std::string text = root.exists(word) ? root.read(word) : "OK";
+                        (void)!send(conn, text.data(), text.size(), MSG_NOSIGNAL);
+                    }
+                }
+            }
+            _exit(0);
         }
-        shutdown(listen_, SHUT_RDWR);
-        thread_.join();
-        close(listen_);
+        close(listenFd);
     }
-    void reply(const std::string &word, const std::string &text) {
-        std::lock_guard<std::mutex> lock(mutex_);
-        replies_[word] = text;
+    ~TestApp() {
+        kill(pid_, SIGKILL);
+        waitpid(pid_, nullptr, 0);
     }
 
 private:
-    void serve(int conn) {
-        {
-            std::lock_guard<std::mutex> lock(mutex_);
-            conn_ = conn;
-            if (stopping_) shutdown(conn, SHUT_RDWR);  // accepted while going away
-        }
-        std::string pending;
-        char buf[256];
-        for (ssize_t n; (n = read(conn, buf, sizeof(buf))) > 0;) {
-            pending.append(buf, static_cast<size_t>(n));
-            for (size_t nul; (nul = pending.find('\0')) != std::string::npos; pending.erase(0, nul + 1)) {
-                std::lock_guard<std::mutex> lock(mutex_);
-                auto it = replies_.find(pending.substr(0, nul));
-                const std::string text = it == replies_.end() ? "OK" : it->second;
-                (void)!send(conn, text.data(), text.size(), MSG_NOSIGNAL);
-            }
-        }
-        std::lock_guard<std::mutex> lock(mutex_);
-        close(conn);
-        conn_ = -1;
-    }
-
-    int listen_;
-    int conn_ = -1;
-    bool stopping_ = false;
-    std::thread thread_;
-    std::mutex mutex_;
-    std::map<std::string, std::string> replies_;
+    pid_t pid_;
 };
 
 class CitTest : public ::testing::Test {
@@ -156,7 +134,7 @@ TEST_F(CitLocal, ResultFileEdges) {
 // The answer buffer holds 1024 bytes: a long answer is cut so that its final
 // result and terminator always fit, and the host always gets a whole final line.
 TEST_F(CitForward, LongAnswersAreCutSoTheFinalResultFits) {
-    FakeTestApp app;
+    TestApp app(root_);
     const struct {
         const char *line, *word;
         std::string answer, shown;
@@ -172,7 +150,7 @@ TEST_F(CitForward, LongAnswersAreCutSoTheFinalResultFits) {
         {"AT*CIT_KEY", "KEY", pattern("no key ", 1024), pattern("no key ", 1014), false},
     };
     for (const auto &c : cases) {
-        app.reply(c.word, c.answer);
+        root_.write(std::string("/app/") + c.word, c.answer);
         EXPECT_EQ(framedVerdict(c.shown, c.ok), ask(c.line)) << c.answer.size() << " bytes answered";
     }
 }
@@ -181,12 +159,12 @@ TEST_F(CitForward, LongAnswersAreCutSoTheFinalResultFits) {
 // the application restarted, the command reaches the new one and is judged on its
 // answer, never on the empty answer of the dead link.
 TEST_F(CitForward, KeptLinkToARestartedApplicationIsNotReused) {
-    auto app = std::make_unique<FakeTestApp>();
+    auto app = std::make_unique<TestApp>(root_);
     EXPECT_EQ("\r\ntest_fail_no_case\r\nERROR\r\n\r\n", ask("AT*CIT_NOSUCH", -1));
     ASSERT_GE(sock_id, 0) << "an unmatched line keeps the link";
     app.reset();  // the application restarts: its link ends, a new one serves
-    app = std::make_unique<FakeTestApp>();
-    app->reply("sn", "SN0042");
+    app = std::make_unique<TestApp>(root_);
+    root_.write("/app/sn", "SN0042");
     EXPECT_EQ(framedVerdict("SN0042", true), ask("AT*CIT_SN"));
 }
 
