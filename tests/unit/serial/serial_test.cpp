@@ -38,7 +38,6 @@ bool sameSettings(const struct termios &a, const struct termios &b) {
 class SerialTest : public ::testing::Test {
 protected:
     void SetUp() override {
-        if (const char *root = getenv("TOLKD_ROOT")) savedRoot_ = root;
         unsetenv("TOLKD_ROOT");
         reset();
         master_ = posix_openpt(O_RDWR | O_NOCTTY);
@@ -52,7 +51,6 @@ protected:
         for (int fd : owned_) close(fd);
         close(master_);
         reset();
-        if (!savedRoot_.empty()) setenv("TOLKD_ROOT", savedRoot_.c_str(), 1);
     }
     static void reset() {
         initSerialDevice(&gSerialDevice);
@@ -76,7 +74,7 @@ protected:
     }
 
     int master_ = -1;
-    std::string slavePath_, savedRoot_;
+    std::string slavePath_;
     std::vector<int> owned_;
 };
 using SerialDeviceTest = SerialTest;
