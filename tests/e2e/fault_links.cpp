@@ -25,8 +25,9 @@ bool adbQuery(int fd) {
 }
 
 // Each replug reopens the port (the old one closed: expectServing counts the
-// descriptors), keeps the echo setting, and never disturbs the adb link.
-TEST(FaultLinks, CableReplugsDuringTraffic) {
+// descriptors), keeps the echo setting, and never disturbs the adb link; an
+// unplug ends the daemon.
+TEST(FaultLinks, CableReplugsDuringTrafficThenUnplugged) {
     SimDevice d;
     ASSERT_TRUE(d.started()) << d.upOutput();
     int fds = baselineFds(d);
@@ -69,6 +70,17 @@ TEST(FaultLinks, CableReplugsDuringTraffic) {
     EXPECT_GT(asked.load(), 0);
     EXPECT_EQ(asked.load(), answered.load()) << "the adb link is not touched by the serial port's loss";
     expectServing(d, fds, "after the replugs");
+
+    // Losing the cable for good ends the daemon with status 1, an open adb
+    // connection or not.
+    HostLink adb(d, true);
+    EXPECT_EQ(visible(kCsdfAnswer), visible(adb.ask("AT+CSDF?")));
+    int status = -1;
+    d.sim({"unplug"}, &status);
+    ASSERT_EQ(0, status);
+    EXPECT_EQ(1, d.tolkdExitStatus(5000));
+    EXPECT_NE(std::string::npos, d.log().find("FATAL Error in serail read"));
+    EXPECT_NE(std::string::npos, d.log().find("The process is terminated due to fatal error"));
 }
 
 // Connections that say nothing, half a line or a whole one, two hundred times. A

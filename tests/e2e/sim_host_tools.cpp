@@ -190,24 +190,6 @@ TEST(SimHostTools, HostRunnerGivesTheHostPortModemLines) {
     dlclose(shim);
 }
 
-TEST(SimHostTools, PyserialSetsAndReadsTheLines) {
-    SimDevice d;
-    ASSERT_TRUE(d.started()) << d.upOutput();
-    if (access(kPython, X_OK) != 0 || runSim({"host", "--root", d.root(), "--", kPython, "-c", "import serial"}) != 0)
-        GTEST_SKIP() << "python3-serial is not installed (apt-get install python3-serial): pyserial is not tested";
-    const char script[] = R"(
-import os, serial
-p = serial.Serial(os.environ["TOLK_HOST_TTY"], 115200, rtscts=True, timeout=2)
-p.dtr = False; p.rts = False
-a = (p.dtr, p.rts, p.cts, p.dsr, p.cd)
-p.dtr = True
-p.write(b"AT*CIT_GACITF\r")
-print(a, (p.dtr, p.rts), p.read_until(b"OK\r\n"))
-)";
-    EXPECT_EQ("(False, False, True, True, True) (True, False) b'AT*CIT_GACITF\\n\\r\\nx0000000\\r\\nOK\\r\\n'\n",
-              d.sim({"host", "--", kPython, "-c", script}));
-}
-
 TEST(SimHostTools, ForwarderRelaysTheAdbLinkOverLoopbackTcp) {
     SimDevice d;
     ASSERT_TRUE(d.started()) << d.upOutput();
