@@ -348,9 +348,8 @@ class Workspace:
     def prepare(self, reuse):
         stamp = os.path.join(self.work, "COMMIT")
         old = open(stamp).read().strip() if os.path.exists(stamp) else None
-        if reuse and old == self.commit:
-            log("reusing %s at %s" % (self.work, self.commit[:10]))
-        elif reuse and old and os.path.isdir(self.src):
+        if reuse and old and os.path.isdir(self.src):
+            # Also undoes a mutant left behind by a run that was killed.
             self.refresh(old)
             with open(stamp, "w") as f:
                 f.write(self.commit + "\n")
@@ -380,7 +379,8 @@ class Workspace:
 
     def refresh(self, old):
         """Brings the copy from commit old to ours, rewriting only changed files (so the build stays incremental)."""
-        log("updating %s from %s to %s" % (self.src, old[:10], self.commit[:10]))
+        log("updating %s from %s to %s" % (self.src, old[:10], self.commit[:10]) if old != self.commit
+            else "reusing %s at %s" % (self.src, self.commit[:10]))
         incoming = os.path.join(self.work, "incoming")
         if os.path.exists(incoming):
             shutil.rmtree(incoming)
@@ -755,6 +755,7 @@ def main():
                     print(site_spec(s))
         return
 
+    signal.signal(signal.SIGTERM, lambda *_: sys.exit(143))  # restore the mutated file on the way out
     os.nice(19 - os.nice(0))  # the machine is shared: lowest priority for us and every child
     ws = Workspace(args)
     if args.write_sample:
