@@ -27,7 +27,7 @@ test: build
 	cd $(BUILD) && ctest --output-on-failure -j $(JOBS) -LE soak
 
 soak: build
-	cd $(BUILD) && ctest --output-on-failure -L soak
+	cd $(BUILD) && ctest --output-on-failure -C soak -L soak
 
 # The whole suite under AddressSanitizer and UndefinedBehaviorSanitizer.
 asan:
