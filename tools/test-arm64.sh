@@ -80,10 +80,9 @@ if ! (cd "$cross" && ctest -L 'unit|platform' -j "$jobs" --timeout 120 --output-
 fi
 
 echo "== end-to-end tests: x86-64 tolk-sim and peers, aarch64 tolkd under qemu"
-# Each test has its own timeout (120 s, the soak 300 s); under qemu the slowest
-# ordinary test takes a few seconds. The soak runs a fifth of its commands.
-(cd "$host" && TOLK_E2E_TOLKD="$wrapper" TOLK_SOAK_COMMANDS=${TOLK_SOAK_COMMANDS:-20000} \
-    ctest -L e2e -j "$jobs" --output-on-failure) || status=1
+# Each test has its own timeout (120 s); under qemu the slowest takes about 10 s.
+# The soak is registered for its own ctest configuration only and is left out.
+(cd "$host" && TOLK_E2E_TOLKD="$wrapper" ctest -L e2e -j "$jobs" --output-on-failure) || status=1
 
 echo "make test-arm64: $(( $(date +%s) - started )) s, $([ $status = 0 ] && echo passed || echo FAILED)"
 exit $status
