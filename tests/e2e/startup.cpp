@@ -44,7 +44,7 @@ TEST(Simulator, DownStopsEverythingAndIsIdempotent) {
     int status = -1;
     EXPECT_EQ("", d.sim({"down"}, &status));
     // A zombie of tolkd is reaped by the supervisor before it exits.
-    EXPECT_TRUE(eventually([&] { return !alive(tolkd) && !alive(supervisor); }, 2000));
+    EXPECT_TRUE(eventually([&] { return !alive(tolkd) && !alive(supervisor); }, 5000));
     d.sim({"down"}, &status);
     EXPECT_EQ(0, status);
     d.sim({"replug"}, &status);
