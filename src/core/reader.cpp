@@ -209,11 +209,14 @@ static int takeCarriedAdbLine(void) {
     const char *cr = (const char *)memchr(adbLine, '\r', (size_t)adbLineLen);
     if (cr == NULL) return 0;
     int len = (int)(cr - adbLine) + 1;
-    char rest[MMITEST_FRAME_LEN];
-    int carry = adbLineLen - len;
-    if (carry > (int)sizeof(rest)) carry = (int)sizeof(rest);
-    memcpy(rest, adbLine + len, carry);
-    return completeAdbLine(len, rest, carry);
+    LOGD(".AT command read done.");
+    memcpy(lineBuf, adbLine, len);
+    lineBuf[len] = '\0';
+    int rest = adbLineLen - len;
+    memmove(adbLine, adbLine + len, rest);
+    memset(adbLine + rest, 0, len);
+    adbLineLen = rest;
+    return len;
 }
 
 static bool beginsWithAt(const char *line, int n) {
