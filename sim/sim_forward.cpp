@@ -117,10 +117,10 @@ short events(const Side &self, const Side &other) {
     return ev;
 }
 
-bool parsePort(const std::string &spec, int *port) {
-    if (spec.compare(0, 4, "tcp:") != 0 || spec.size() == 4) return false;
+bool parsePort(const std::string &address, int *port) {
+    if (address.compare(0, 4, "tcp:") != 0 || address.size() == 4) return false;
     char *end = nullptr;
-    long v = strtol(spec.c_str() + 4, &end, 10);
+    long v = strtol(address.c_str() + 4, &end, 10);
     if (*end != '\0' || v < 0 || v > 65535) return false;
     *port = static_cast<int>(v);
     return true;

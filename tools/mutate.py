@@ -234,7 +234,7 @@ def find_sites(relpath, text):
     return sites
 
 
-def site_spec(s):
+def site_label(s):
     return "%s:%d:%d:%s:%s%s%s" % (s["file"], s["line"], s["col"], s["kind"], s["orig"], ARROW, s["repl"])
 
 
@@ -242,9 +242,9 @@ def parse_sample_line(raw):
     raw = raw.rstrip("\n")
     if not raw.strip() or raw.lstrip().startswith("#"):
         return None
-    spec, _, ctx = raw.partition("\t")
+    label, _, ctx = raw.partition("\t")
     ctx = ctx[2:] if ctx.startswith("| ") else ctx
-    f, line, col, kind, rest = spec.split(":", 4)
+    f, line, col, kind, rest = label.split(":", 4)
     orig, repl = rest.split(ARROW, 1)
     return {"file": f, "line": int(line), "col": int(col), "kind": kind, "orig": orig,
             "repl": repl, "context": ctx}
@@ -509,7 +509,7 @@ def draw(root, count, seed, filt):
     weights = {}
     for rel in all_sources(root):
         text = open(os.path.join(root, rel), encoding="utf-8", errors="replace").read()
-        sites = [s for s in find_sites(rel, text) if not filt or re.search(filt, site_spec(s))]
+        sites = [s for s in find_sites(rel, text) if not filt or re.search(filt, site_label(s))]
         if sites:
             per_file[rel] = sites
             weights[rel] = code_lines(text)
@@ -589,9 +589,9 @@ def write_sample(args, ws):
             if args.no_compile_check or compiles(ws, s):
                 chosen.append(s)
                 got += 1
-                log("sample %2d  %s" % (len(chosen), site_spec(s)))
+                log("sample %2d  %s" % (len(chosen), site_label(s)))
             else:
-                log("invalid, drawing another: %s" % site_spec(s))
+                log("invalid, drawing another: %s" % site_label(s))
     ws.rebuild()  # leave the build matching the unmutated tree
     with open(args.write_sample, "w") as f:
         f.write("# Mutants for tools/mutate.py, one per line: file:line:column:kind:original%sreplacement\n" % ARROW)
@@ -599,7 +599,7 @@ def write_sample(args, ws):
         f.write("# Drawn with --seed %d --count %d%s from %s; each one compiled there.\n"
                 % (args.seed, args.count, " --filter %s" % args.filter if args.filter else "", ws.subject))
         for s in chosen:
-            f.write("%s\t| %s\n" % (site_spec(s), s["context"]))
+            f.write("%s\t| %s\n" % (site_label(s), s["context"]))
     log("wrote %d mutants to %s" % (len(chosen), args.write_sample))
 
 
@@ -630,7 +630,7 @@ def summarize(results, out=sys.stdout):
                                                     ARROW, r["repl"]))
             out.write("   in: %s\n" % r["context"] if r.get("context") else "\n")
     for r in invalid + missing:
-        out.write("  %s: %s\n" % (r["status"], r["spec"]))
+        out.write("  %s: %s\n" % (r["status"], r["site"]))
 
 
 def run_mutants(args, ws):
@@ -643,7 +643,7 @@ def run_mutants(args, ws):
             want, ordered = plan[rel]
             sites.extend(ordered[:want])
     if args.filter:
-        sites = [s for s in sites if re.search(args.filter, site_spec(s))]
+        sites = [s for s in sites if re.search(args.filter, site_label(s))]
     if args.count and args.sample:
         sites = sites[:args.count]
     if not sites:
@@ -681,15 +681,15 @@ def run_mutants(args, ws):
         emit({"type": "baseline", "passed": ok, "failed": failed, "seconds": round(secs, 1), "exclude": exclude})
 
     for i, site in enumerate(sites, 1):
-        spec = site_spec(site)
-        rec = {"type": "mutant", "n": i, "spec": spec, "file": site["file"], "line": site["line"],
+        label = site_label(site)
+        rec = {"type": "mutant", "n": i, "site": label, "file": site["file"], "line": site["line"],
                "col": site["col"], "kind": site["kind"], "orig": site["orig"], "repl": site["repl"],
                "context": site["context"]}
         t0 = time.time()
         original = apply(ws, site)
         if original is None:
             rec.update(status="missing")
-            log("%2d/%d missing   %s" % (i, len(sites), spec))
+            log("%2d/%d missing   %s" % (i, len(sites), label))
             emit(rec)
             continue
         rec["line"], rec["col"] = site["line"], site["col"]  # where it was found in this commit
@@ -708,7 +708,7 @@ def run_mutants(args, ws):
                     rec.update(status="killed", group=group, killed_by=failed[:5])
         finally:
             restore(ws, site, original)
-        log("%2d/%d %-9s %s%s  (%.0f s)" % (i, len(sites), rec["status"], spec,
+        log("%2d/%d %-9s %s%s  (%.0f s)" % (i, len(sites), rec["status"], label,
                                            "  by " + ",".join(rec.get("killed_by", [])[:2]) if rec["status"] == "killed" else "",
                                            time.time() - t0))
         emit(rec)
@@ -751,8 +751,8 @@ def main():
     if args.list:
         for rel in all_sources(args.tree):
             for s in find_sites(rel, open(os.path.join(args.tree, rel), encoding="utf-8").read()):
-                if not args.filter or re.search(args.filter, site_spec(s)):
-                    print(site_spec(s))
+                if not args.filter or re.search(args.filter, site_label(s)):
+                    print(site_label(s))
         return
 
     signal.signal(signal.SIGTERM, lambda *_: sys.exit(143))  # restore the mutated file on the way out
