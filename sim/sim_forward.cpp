@@ -49,27 +49,9 @@ void closeSide(Side *s) {
     s->fd = -1;
 }
 
-int connectLocal(const std::string &path) {
-    struct sockaddr_un addr;
-    memset(&addr, 0, sizeof addr);
-    addr.sun_family = AF_UNIX;
-    if (path.size() >= sizeof addr.sun_path) {
-        errno = ENAMETOOLONG;
-        return -1;
-    }
-    memcpy(addr.sun_path, path.c_str(), path.size() + 1);
-    // Non-blocking: a full backlog fails this connection instead of holding
-    // every other relay.
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_NONBLOCK | SOCK_CLOEXEC, 0);
-    if (fd < 0) return -1;
-    if (connect(fd, reinterpret_cast<struct sockaddr *>(&addr), sizeof addr) != 0) {
-        int err = errno;
-        close(fd);
-        errno = err;
-        return -1;
-    }
-    return fd;
-}
+// Non-blocking: a full backlog fails this connection instead of holding every
+// other relay.
+int connectLocal(const std::string &path) { return connectUnix(path, SOCK_NONBLOCK); }
 
 // Reads what from has into to's queue; marks the end of input.
 void pump(Side *from, Side *to, Relay *r) {

@@ -149,10 +149,10 @@ int bindUnix(const std::string &path, int backlog, bool cloexec) {
     return fd;
 }
 
-int connectUnix(const std::string &path) {
+int connectUnix(const std::string &path, int socketFlags) {
     struct sockaddr_un addr;
     if (!unixAddress(path, &addr)) return -1;
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
+    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | socketFlags, 0);
     if (fd < 0) return -1;
     if (connect(fd, reinterpret_cast<struct sockaddr *>(&addr), sizeof addr) != 0) {
         int e = errno;

@@ -55,9 +55,9 @@ bool fitsSocketPath(const std::string &path);
 // for backlog >= 0, listening. The descriptor, or -1 with errno (ENAMETOOLONG for
 // a path that does not fit).
 int bindUnix(const std::string &path, int backlog, bool cloexec = true);
-// A stream connection to the AF_UNIX socket at path; the descriptor, or -1 with
-// errno.
-int connectUnix(const std::string &path);
+// A stream connection to the AF_UNIX socket at path (socketFlags, such as
+// SOCK_NONBLOCK, join the socket's type); the descriptor, or -1 with errno.
+int connectUnix(const std::string &path, int socketFlags = 0);
 // Writes all bytes, retrying EINTR and short writes, never raising SIGPIPE (a
 // descriptor that is no socket, such as a tty, is written to plainly).
 bool sendAll(int fd, const void *data, size_t len);
