@@ -15,9 +15,9 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <cstring>
-#include <fstream>
 #include <sstream>
 
 #include <gtest/gtest.h>
@@ -148,46 +148,26 @@ void SimDevice::setprop(const std::string &name, const std::string &value) {
     EXPECT_EQ(0, status) << "setprop " << name << "=" << value << " refused";
 }
 
-std::string SimDevice::readFile(const std::string &devicePath) const {
-    std::ifstream in(root_ + devicePath, std::ios::binary);
-    std::ostringstream ss;
-    ss << in.rdbuf();
-    return ss.str();
-}
+std::string SimDevice::readFile(const std::string &devicePath) const { return sim::readFileOr(root_ + devicePath); }
 
 void SimDevice::writeFile(const std::string &devicePath, const std::string &content) const {
     std::string path = root_ + devicePath;
     sim::makeDirs(path.substr(0, path.rfind('/')));
-    std::ofstream out(path, std::ios::binary | std::ios::trunc);
-    out << content;
+    EXPECT_TRUE(sim::writeFile(path, content)) << "cannot write " << path;
 }
 
-bool SimDevice::fileExists(const std::string &devicePath) const {
-    struct stat st;
-    return lstat((root_ + devicePath).c_str(), &st) == 0;
-}
+bool SimDevice::fileExists(const std::string &devicePath) const { return sim::fileExists(root_ + devicePath); }
 
 std::string SimDevice::log() const { return readFile("/log/tolkd.log"); }
 
 std::string SimDevice::env(const std::string &key) const {
+    // Values are single-quoted shell words; ours (numbers, paths under /tmp) hold no quote.
     std::istringstream in(readFile("/sim.env"));
-    std::string line;
-    while (std::getline(in, line)) {
+    for (std::string line; std::getline(in, line);) {
         if (line.compare(0, key.size() + 1, key + "=") != 0) continue;
         std::string v = line.substr(key.size() + 1);
-        // Values are single-quoted shell words ('\'' for a quote).
-        std::string out;
-        bool quoted = false;
-        for (size_t i = 0; i < v.size(); i++) {
-            if (v[i] == '\'') {
-                quoted = !quoted;
-            } else if (!quoted && v[i] == '\\' && i + 1 < v.size()) {
-                out.push_back(v[++i]);
-            } else {
-                out.push_back(v[i]);
-            }
-        }
-        return out;
+        v.erase(std::remove(v.begin(), v.end(), '\''), v.end());
+        return v;
     }
     return "";
 }
