@@ -10,10 +10,11 @@ namespace {
 using DispatcherTest = HandlerTest;
 using BatCmdTest = HandlerTest;
 
+// Exact names of the battery table, and the local table before the generic one
+// where both have a name (AT%WLAN?), are checked in local_commands.tx.
 TEST_F(DispatcherTest, ExactStagesNeedTheWholeNameAudioStagesAPrefix) {
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CCLKX?"));
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT%ECALLX"));
-    EXPECT_EQ(RIL_TYPE, process_cmd_line("AT@GBVX"));
     EXPECT_EQ(RIL_TYPE, process_cmd_line("at+cclk?")) << "names compare case-sensitively";
     EXPECT_EQ(AUDIO_EXT_TYPE, process_cmd_line("AT+EADPX"));
     EXPECT_EQ(RIL_TYPE, process_cmd_line("aud+1")) << "audio rows are case-sensitive";
@@ -28,30 +29,19 @@ TEST_F(DispatcherTest, ExactStagesNeedTheWholeNameAudioStagesAPrefix) {
     EXPECT_EQ(RIL_TYPE, process_cmd_line((std::string("AT%SUPPLEMENTARYSERVICE") + std::string(20, ' ') + "=1").c_str()));
     EXPECT_EQ(RIL_TYPE, process_cmd_line((std::string("AT%ECALL") + std::string(40, 'X')).c_str()));
     EXPECT_EQ("", host.take()) << "nothing above is answered locally";
-
-    // %WLAN, %MAC and +VZWTOLKCFG are in both tables; the local one wins.
-    EXPECT_EQ(TOLK_TYPE, process_cmd_line("AT%WLAN?"));
-    EXPECT_EQ("\r\nERROR\r\n", host.take());
-    EXPECT_EQ(TOLK_TYPE, process_cmd_line("AT+VZWTOLKCFG?"));
-    EXPECT_EQ("\r\n+VZWTOLKCFG:0\r\n\r\nOK\r\n", host.take());
 }
 
 // The SMS storage commands stay on the modem in PCT mode (unset means PCT mode);
 // the APN settings go to the framework until AT+VZWTOLKCFG=1.
 TEST_F(DispatcherTest, PctModeAndVzwTolkCfgMoveCommandsBetweenModemAndFramework) {
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CMGF=1"));
-    EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CPMS?"));
     EXPECT_EQ(GENERIC_TYPE, process_cmd_line("AT+CBC")) << "only the five SMS commands are affected";
     ASSERT_EQ(0, property_set("persist.service.pct.mode", "0"));
     EXPECT_EQ(GENERIC_TYPE, process_cmd_line("AT+CMGR=3"));
-    ASSERT_EQ(0, property_set("persist.service.pct.mode", "1"));
-    EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CMGL=\"ALL\""));
 
     EXPECT_EQ(GENERIC_TYPE, process_cmd_line("AT+VZWAPNE=1,3,\"vzwims\""));
-    EXPECT_EQ(GENERIC_TYPE, process_cmd_line("AT+VZWAPNETMR=1,2"));
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+VZWAPNE?"));
     EXPECT_EQ(TOLK_TYPE, process_cmd_line("AT+VZWTOLKCFG=1"));
-    EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+VZWAPNE=1,3,\"vzwims\""));
     EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+VZWAPNETMR=1,2"));
 }
 
