@@ -1,23 +1,23 @@
 // An in-test radio service: listens on the socket of one instance under the
 // current device root, records the frames its clients send and lets the test
-// answer, indicate or cut the connections.
+// answer, indicate or cut the connections. It has no thread of its own: every
+// call first takes in the connections and frames that have arrived, so only the
+// test's thread ever touches it.
 #ifndef TOLK_TESTS_HIDL_FAKE_RADIO_SERVICE_H
 #define TOLK_TESTS_HIDL_FAKE_RADIO_SERVICE_H
 
+#include <cutils/sockets.h>
+#include <poll.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <unistd.h>
 
-#include <chrono>
-#include <condition_variable>
-#include <cstring>
-#include <filesystem>
-#include <mutex>
 #include <string>
-#include <thread>
 #include <vector>
 
+#include <tolk_platform/local_socket.h>
 #include <tolk_platform/radio_wire.h>
+
+#include "eventually.h"
 
 struct FakeRadioFrame {
     uint32_t type;
@@ -29,100 +29,70 @@ struct FakeRadioFrame {
 class FakeRadioService {
 public:
     // socketPath: host path of the instance's socket (TestRoot::at of the device path).
-    explicit FakeRadioService(const std::string &socketPath) : path_(socketPath) {
-        std::filesystem::create_directories(std::filesystem::path(path_).parent_path());
-        listenFd_ = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-        sockaddr_un addr{};
-        addr.sun_family = AF_UNIX;
-        std::strncpy(addr.sun_path, path_.c_str(), sizeof(addr.sun_path) - 1);
-        if (bind(listenFd_, reinterpret_cast<sockaddr *>(&addr), sizeof(addr)) != 0 || listen(listenFd_, 4) != 0) {
-            close(listenFd_);
-            listenFd_ = -1;
-            return;
-        }
-        acceptThread_ = std::thread([this] { acceptLoop(); });
-    }
+    explicit FakeRadioService(const std::string &socketPath)
+        : listenFd_(tolk_local_server(socketPath.c_str(), ANDROID_SOCKET_NAMESPACE_FILESYSTEM, SOCK_STREAM, 4)) {}
     ~FakeRadioService() {
-        stop();
-        dropConnections();
-        for (auto &t : readers_) t.join();
+        for (int fd : clients_) {
+            if (fd >= 0) close(fd);
+        }
+        if (listenFd_ >= 0) close(listenFd_);
     }
+    FakeRadioService(const FakeRadioService &) = delete;
+    FakeRadioService &operator=(const FakeRadioService &) = delete;
 
-    bool ok() const { return listenFd_ >= 0 || stopped_; }
-    // Stops accepting: the instance is gone for new getService calls.
-    void stop() {
-        if (stopped_) return;
-        stopped_ = true;
-        unlink(path_.c_str());
-        if (listenFd_ < 0) return;
-        shutdown(listenFd_, SHUT_RDWR);
-        acceptThread_.join();
-        close(listenFd_);
-    }
+    bool ok() const { return listenFd_ >= 0; }
     // Ends every client connection, as a dying service would.
     void dropConnections() {
-        std::lock_guard<std::mutex> lock(mutex_);
+        takeArrivals();
         for (int fd : clients_) {
             if (fd >= 0) shutdown(fd, SHUT_RDWR);
         }
     }
     bool waitFrames(size_t count) {
-        std::unique_lock<std::mutex> lock(mutex_);
-        return cv_.wait_for(lock, std::chrono::seconds(3), [&] { return frames_.size() >= count; });
+        return eventually([&] { return takeArrivals(), frames_.size() >= count; });
     }
-    std::vector<FakeRadioFrame> frames() {
-        std::lock_guard<std::mutex> lock(mutex_);
-        return frames_;
-    }
-    int connections() {
-        std::lock_guard<std::mutex> lock(mutex_);
-        return static_cast<int>(clients_.size());
-    }
+    const std::vector<FakeRadioFrame> &frames() { return takeArrivals(), frames_; }
+    int connections() { return takeArrivals(), static_cast<int>(clients_.size()); }
     // Sends to the newest client connection; false when there is none.
     bool send(uint32_t type, const std::string &payload) {
-        std::lock_guard<std::mutex> lock(mutex_);
-        if (clients_.empty() || clients_.back() < 0) return false;
-        return radio_wire_send(clients_.back(), type, -1, 0, payload.data(), static_cast<uint32_t>(payload.size())) ==
-               0;
+        takeArrivals();
+        return !clients_.empty() && clients_.back() >= 0 &&
+               radio_wire_send(clients_.back(), type, -1, 0, payload.data(), static_cast<uint32_t>(payload.size())) ==
+                   0;
     }
     bool respond(const std::string &payload) { return send(RADIO_WIRE_RESPONSE, payload); }
     bool indicate(const std::string &payload) { return send(RADIO_WIRE_INDICATION, payload); }
 
 private:
-    void acceptLoop() {
-        for (;;) {
-            int fd = accept4(listenFd_, nullptr, nullptr, SOCK_CLOEXEC);
-            if (fd < 0 && errno == EINTR) continue;
-            if (fd < 0) return;
-            std::lock_guard<std::mutex> lock(mutex_);
-            int index = static_cast<int>(clients_.size());
-            clients_.push_back(fd);
-            readers_.emplace_back([this, fd, index] { readLoop(fd, index); });
+    // Accepts waiting clients and reads their frames, until nothing more is there.
+    void takeArrivals() {
+        for (bool more = true; more;) {
+            std::vector<pollfd> fds = {{listenFd_, POLLIN, 0}};
+            for (int fd : clients_) fds.push_back({fd, POLLIN, 0});  // poll skips the closed (-1)
+            more = poll(fds.data(), fds.size(), 0) > 0;
+            if (more && fds[0].revents != 0) {
+                int fd = accept4(listenFd_, nullptr, nullptr, SOCK_CLOEXEC);
+                if (fd >= 0) clients_.push_back(fd);
+                more = fd >= 0;
+            }
+            for (size_t i = 1; i < fds.size(); i++) {
+                RadioWireHeader hdr;
+                if (fds[i].revents == 0) continue;
+                if (radio_wire_recv(fds[i].fd, &hdr, buf_.data(), buf_.size()) == 0) {
+                    std::string payload(buf_.data(), hdr.length);
+                    frames_.push_back({hdr.type, hdr.serial, payload, static_cast<int>(i) - 1});
+                } else {
+                    close(fds[i].fd);  // the client has gone
+                    clients_[i - 1] = -1;
+                }
+            }
         }
-    }
-    void readLoop(int fd, int index) {
-        std::vector<char> buf(RADIO_WIRE_MAX_PAYLOAD);
-        RadioWireHeader hdr;
-        while (radio_wire_recv(fd, &hdr, buf.data(), buf.size()) == 0) {
-            std::lock_guard<std::mutex> lock(mutex_);
-            frames_.push_back(FakeRadioFrame{hdr.type, hdr.serial, std::string(buf.data(), hdr.length), index});
-            cv_.notify_all();
-        }
-        std::lock_guard<std::mutex> lock(mutex_);
-        // Closed here only, so the number cannot be reused under a sender.
-        close(fd);
-        clients_[index] = -1;
     }
 
-    std::string path_;
-    int listenFd_ = -1;
-    bool stopped_ = false;
-    std::thread acceptThread_;
-    std::vector<std::thread> readers_;
-    std::mutex mutex_;
-    std::condition_variable cv_;
+    int listenFd_;
     std::vector<int> clients_;
     std::vector<FakeRadioFrame> frames_;
+    std::vector<char> buf_ = std::vector<char>(RADIO_WIRE_MAX_PAYLOAD);
 };
 
 #endif
