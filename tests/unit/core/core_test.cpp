@@ -6,15 +6,10 @@
 #include <sys/ioctl.h>
 #include <sys/resource.h>
 #include <sys/wait.h>
-#include <sys/socket.h>
 #include <sys/un.h>
 #include <termios.h>
-#include <unistd.h>
-
-#include <string>
 
 #include <cutils/properties.h>
-#include <gtest/gtest.h>
 
 #include "core/reader.h"
 #include "core/sms_merge.h"

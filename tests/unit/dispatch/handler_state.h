@@ -4,10 +4,8 @@
 #define TOLK_TESTS_DISPATCH_HANDLER_STATE_H
 
 #include <cutils/properties.h>
-#include <gtest/gtest.h>
 
 #include <cstring>
-#include <string>
 
 #include "dispatch/dispatcher.h"
 #include "handlers/handlers.h"
