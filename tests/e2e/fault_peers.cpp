@@ -1,6 +1,7 @@
-// Peers that die, restart, stay silent or hang up early. Whatever they do, the
-// host gets an answer or a defined failure, the daemon keeps serving, keeps its
-// descriptor count, and every command reaches the peer exactly once.
+// Peers that die under traffic, restart or answer too much: the host gets an
+// answer or a defined failure, the daemon keeps serving, keeps its descriptor
+// count, and every command reaches the peer exactly once. (Peers silent,
+// hanging up or stopped while the daemon waits: transcripts/peer_faults.tx.)
 #include <unistd.h>
 
 #include <atomic>
@@ -18,19 +19,19 @@ const std::string kCsq = "\r\n+CSQ: 20,99\r\n\r\nOK\r\n";
 const std::string kNoModem = "\r\nERROR:No Modem\r\n";
 const std::string kOk = "\r\nOK\r\n";
 
-void peer(SimDevice &d, const char *step, const char *name) {
-    int status = -1;
-    d.sim({step, name}, &status);
-    ASSERT_EQ(0, status) << step << " " << name;
-}
-
-// The service is stopped and started by another thread while the host keeps
-// sending: each command ends in its answer or "ERROR:No Modem"; only a command in
-// flight at the moment of a kill may go unanswered, at most one per kill.
+// The radio service is stopped and started by another thread while the host
+// keeps sending: each command ends in its answer or "ERROR:No Modem"; only a
+// command in flight at the moment of a kill may go unanswered, at most one per
+// kill. Then the other peers hang up, or stop while the daemon waits on them,
+// and restart: their links are made again and none is left behind.
 TEST(FaultPeers, RadioServiceFlappingUnderTraffic) {
     SimDevice d({"--prop", "persist.service.tolk.usermode=1"});
     ASSERT_TRUE(d.started()) << d.upOutput();
-    EXPECT_EQ(visible(kCsq), visible(d.at("AT+CSQ", true)));
+    d.writeFile("/sim/generic/script", "AT+MODEL => (close)\nAT+POWERKEY => (none)\n");
+    d.writeFile("/sim/audio/script", "MM+LOOP=1 => (close)\nAUD+TXT => (none)\n");
+    d.writeFile("/sim/cit/script", "KEY => (close)\nGPS => (none)\n");
+    const char *const everyPeer[] = {"AT+CSQ", "AT%OSVER", "AUD+BIN", "AT+EAPS=0", "AT*CIT_SN"};
+    for (const char *line : everyPeer) EXPECT_NE("", d.at(line, true)) << line;
     int fds = baselineFds(d);
     HostLink adb(d, true);
 
@@ -65,87 +66,17 @@ TEST(FaultPeers, RadioServiceFlappingUnderTraffic) {
     EXPECT_EQ(visible(kCsq), visible(adb.ask("AT+CSQ")));
     EXPECT_EQ(answered + 1 + 1, countOf(d.readFile("/journal/radio.slot1.log"), "-1\tAT+CSQ\\x00\n") - silent)
         << answered << " answered, " << refused << " refused, " << silent << " silent";
-    expectServing(d, fds, "after flapping");
-}
 
-// A silent answer to an ordinary command holds nothing up; a service that hangs
-// up instead of answering is reconnected for the next one. The power key waits
-// for its answer (by design, without a limit), lines sent meanwhile wait too and
-// are served once the service is gone; closing early on it returns at once.
-TEST(FaultPeers, GenericServiceSilentClosingAndKilled) {
-    SimDevice d;
-    ASSERT_TRUE(d.started()) << d.upOutput();
-    d.writeFile("/sim/generic/script", "AT+SN => (none)\nAT+MODEL => (close)\nAT+POWERKEY => (none)\n");
-    EXPECT_EQ(visible(kOk), visible(d.at("AT%OSVER", true)));
-    int fds = baselineFds(d);
-    HostLink adb(d, true);
-
-    EXPECT_EQ("", adb.silent("AT+SN"));
-    EXPECT_EQ(visible(kCsdfAnswer), visible(adb.ask("AT+CSDF?")));
-    EXPECT_EQ("", adb.silent("AT+MODEL"));
-    EXPECT_EQ(visible(kOk), visible(adb.ask("AT%OSVER")));
-
-    EXPECT_EQ("", adb.silent("AT+POWERKEY"));
-    EXPECT_EQ("", adb.silent("AT+CSDF?")) << "the daemon waits for the power key";
-    peer(d, "stop", "generic");
-    EXPECT_EQ(visible(kCsdfAnswer), visible(adb.answer()));
-    peer(d, "start", "generic");
-    EXPECT_EQ(visible(kOk), visible(adb.ask("AT%OSVER")));
-
-    d.writeFile("/sim/generic/script", "AT+POWERKEY => (close)\n");
-    EXPECT_EQ("", adb.silent("AT+POWERKEY"));
-    EXPECT_EQ(visible(kCsdfAnswer), visible(adb.ask("AT+CSDF?")));
-    EXPECT_EQ(visible(kOk), visible(adb.ask("AT%OSVER")));
-
-    EXPECT_EQ("AT%OSVER\nAT+SN\nAT+MODEL\nAT%OSVER\nAT+POWERKEY\nAT%OSVER\nAT+POWERKEY\nAT%OSVER\n",
-              d.readFile("/journal/generic.log"));
-    expectServing(d, fds, "after the generic service faults");
-}
-
-// A silent audio service holds the daemon until it goes away; one that hangs up
-// early gives the host nothing, and the next command reconnects.
-TEST(FaultPeers, AudioServiceSilentClosingAndKilled) {
-    SimDevice d;
-    ASSERT_TRUE(d.started()) << d.upOutput();
-    EXPECT_EQ(visible(kOk), visible(d.at("AT+EAPS=0", true)));
-    EXPECT_EQ(visible(kOk), visible(d.at("AUD+TXT", true)));
-    int fds = baselineFds(d);
-    d.writeFile("/sim/audio/script", "AUD+TXT => (none)\nMM+LOOP=1 => (close)\n");
-    HostLink adb(d, true);
-
-    EXPECT_EQ("", adb.silent("AUD+TXT"));
-    EXPECT_EQ("", adb.silent("AT+CSDF?"));
-    peer(d, "stop", "audio");
-    EXPECT_EQ(visible(kCsdfAnswer), visible(adb.answer()));
-    peer(d, "start", "audio");
-    EXPECT_EQ(visible(kOk), visible(adb.ask("AUD+BIN")));
-    EXPECT_EQ("", adb.silent("MM+LOOP=1"));
-    EXPECT_EQ(visible(kCsdfAnswer), visible(adb.ask("AT+CSDF?")));
-    EXPECT_EQ(visible(kOk), visible(adb.ask("AUD+BIN")));
-    EXPECT_EQ("8 AUD+TXT\\x00\n8 AUD+TXT\\x00\n8 AUD+BIN\\x00\n10 MM+LOOP=1\\x00\n8 AUD+BIN\\x00\n",
-              d.readFile("/journal/audio.log"));
-    expectServing(d, fds, "after the audio service faults");
-}
-
-// The application went away without answering: no pass, then the queued line
-// is served. One that hangs up instead of answering is no pass either.
-TEST(FaultPeers, CitApplicationSilentClosingAndKilled) {
-    SimDevice d;
-    ASSERT_TRUE(d.started()) << d.upOutput();
-    d.writeFile("/sim/cit/script", "GPS => (none)\nKEY => (close)\n");
-    EXPECT_NE("", d.at("AT*CIT_SN", true));
-    int fds = baselineFds(d);
-    HostLink adb(d, true);
-
-    EXPECT_EQ("", adb.silent("AT*CIT_GPS"));
-    EXPECT_EQ("", adb.silent("AT+CSDF?")) << "nothing else is served while the daemon waits";
-    peer(d, "stop", "cit");
-    EXPECT_EQ(visible("\r\nERROR\r\n" + std::string(kCsdfAnswer)), visible(adb.answer()));
-    peer(d, "start", "cit");
-    EXPECT_EQ(visible("\r\nERROR\r\n"), visible(adb.ask("AT*CIT_KEY"))) << "no answer is no pass";
-    EXPECT_EQ(visible(kCsdfAnswer), visible(adb.ask("AT+CSDF?")));
-    EXPECT_EQ("sn\nGPS\nKEY\n", d.readFile("/journal/cit.log"));
-    expectServing(d, fds, "after the CIT application faults");
+    for (const char *line : {"AT+MODEL", "MM+LOOP=1", "AT*CIT_KEY"}) adb.ask(line, 300);
+    const char *const held[][2] = {{"AT+POWERKEY", "generic"}, {"AUD+TXT", "audio"}, {"AT*CIT_GPS", "cit"}};
+    for (const auto &h : held) {
+        adb.silent(h[0]);
+        simOk(d, {"stop", h[1]});
+        adb.answer(300);
+        simOk(d, {"start", h[1]});
+    }
+    for (const char *line : everyPeer) EXPECT_NE("", adb.ask(line)) << line;
+    expectServing(d, fds, "after the peers' faults");
 }
 
 // The audio service restarted while the daemon kept its link: the first command
@@ -155,8 +86,8 @@ TEST(FaultPeersAudio, FirstCommandAfterARestartIsAnswered) {
     ASSERT_TRUE(d.started()) << d.upOutput();
     HostLink adb(d, true);
     EXPECT_EQ(visible(kOk), visible(adb.ask("AUD+BIN")));
-    peer(d, "stop", "audio");
-    peer(d, "start", "audio");
+    simOk(d, {"stop", "audio"});
+    simOk(d, {"start", "audio"});
     EXPECT_EQ(visible(kOk), visible(adb.ask("AUD+BIN")));
     EXPECT_EQ("8 AUD+BIN\\x00\n8 AUD+BIN\\x00\n", d.readFile("/journal/audio.log"));
 }
