@@ -9,13 +9,13 @@
 
 namespace {
 
+// The plain forms are told apart by the answers of the transcripts as well
+// (ATQ0V1E, AT%REBOOT, AT+CCLK?, AT+CCLK=?).
 TEST(AtOp, Forms) {
     const std::pair<const char *, AtOpType> cases[] = {
-        {"", AT_NONE_OP},           {"A", AT_NONE_OP},           {"AT", AT_BASIC_OP},
-        {"ATQ0V1E", AT_BASIC_OP},   {"ATE?", AT_BASIC_OP},       {"atd123", AT_BASIC_OP},
-        {"AT+CMEC", AT_ACTION_OP},  {"AT%REBOOT", AT_ACTION_OP}, {"AT+CCLK?", AT_READ_OP},
-        {"AT?", AT_READ_OP},        {"AT#CLS=?", AT_TEST_OP},    {"AT+EURC=\"a?\"", AT_READ_OP},
-        {"AT+X=a=b", AT_SET_OP},
+        {"", AT_NONE_OP},         {"A", AT_NONE_OP},          {"ATE?", AT_BASIC_OP},
+        {"atd123", AT_BASIC_OP},  {"AT+CMEC", AT_ACTION_OP},  {"AT?", AT_READ_OP},
+        {"AT#CLS=?", AT_TEST_OP}, {"AT+EURC=\"a?\"", AT_READ_OP}, {"AT+X=a=b", AT_SET_OP},
     };
     for (const auto &c : cases) {
         std::string text = c.first;
@@ -58,12 +58,10 @@ TEST(AtTok, ParameterWalkUsesUpCursor) {
     cursor = &csq[0];
     EXPECT_EQ(-1, at_tok_start_flag(&cursor, '\0'));
     EXPECT_EQ(nullptr, cursor);
-}
 
-// One token each: its result, the value stored (even when nothing converted) and
-// what is left of the line ("<null>": used up). Quoted strings and 64-bit numbers
-// are checked end to end (USB configuration, Wi-Fi addresses).
-TEST(AtTok, QuotedTokensAndNumbers) {
+    // One number each: its result, the value stored (even when nothing converted)
+    // and what is left of the line ("<null>": used up). Quoted strings and 64-bit
+    // numbers are checked end to end (USB configuration, Wi-Fi addresses).
     struct Case {
         const char *text;
         int result, value;
@@ -74,8 +72,8 @@ TEST(AtTok, QuotedTokensAndNumbers) {
         {",5", -1, 0, "5"},         {"\"12\"", 0, 12, ""},      {"\"3\"x,b", 0, 3, "b"},
     };
     for (const Case &c : cases) {
-        std::string line = c.text;
-        char *cursor = &line[0];
+        line = c.text;
+        cursor = &line[0];
         int v = 99;
         EXPECT_EQ(c.result, at_tok_nextint(&cursor, &v)) << c.text;
         EXPECT_EQ(c.value, v) << c.text;
