@@ -1,7 +1,8 @@
-// The simulator's host-side tools and promises: a fresh root has the phone's
-// persistent folders, `start` returns once a peer accepts, the host runner gives
-// the host port USB ACM modem lines, the forwarder serves the adb link on a
-// loopback TCP port, and slot 1 can be a modem on a serial device.
+// The simulator's host-side promises that tests and host tools lean on: `start`
+// returns once the peer accepts, the host port has the modem lines of a USB ACM
+// port, the forwarder serves the adb link on a loopback TCP port, and slot 1 can
+// be a modem on a serial device. Real host programs through `tolk-sim host` are
+// in host_clients.cpp.
 #include <arpa/inet.h>
 #include <dlfcn.h>
 #include <fcntl.h>
@@ -12,69 +13,19 @@
 #include <signal.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
-#include <sys/un.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <cstdlib>
 #include <cstring>
-#include <fstream>
-#include <sstream>
 #include <string>
 
 #include <gtest/gtest.h>
 
+#include "../../sim/sim_util.h"
 #include "../support/eventually.h"
 #include "sim_device.h"
 
 namespace {
-
-const char kPython[] = "/usr/bin/python3";
-
-// The modem lines of the host port as one word: D R (DTR, RTS), d c C (DSR,
-// CTS, CD), as one host process sees them.
-const char kLinesScript[] = R"(
-import fcntl, os, struct, termios
-fd = os.open(os.environ["TOLK_HOST_TTY"], os.O_RDWR | os.O_NOCTTY)
-def lines(op=termios.TIOCMGET, bits=0):
-    v = struct.unpack("i", fcntl.ioctl(fd, op, struct.pack("i", bits)))[0]
-    if op != termios.TIOCMGET: return lines()
-    return "".join(n for n, b in (("D", termios.TIOCM_DTR), ("R", termios.TIOCM_RTS), ("d", termios.TIOCM_DSR),
-                                  ("c", termios.TIOCM_CTS), ("C", termios.TIOCM_CAR)) if v & b)
-out = [lines()]
-for arg in os.sys.argv[1:]:
-    op, bits = arg.split("=")
-    out.append(lines(getattr(termios, op), eval(bits, vars(termios))))
-t = termios.tcgetattr(fd)
-t[2] |= termios.CRTSCTS | termios.CLOCAL | termios.HUPCL
-t[4] = t[5] = termios.B921600
-termios.tcsetattr(fd, termios.TCSANOW, t)
-out.append("921600" if termios.tcgetattr(fd)[4] == termios.B921600 else "speed lost")
-try:
-    fcntl.ioctl(os.open("/dev/null", os.O_RDWR), termios.TIOCMGET, struct.pack("i", 0))
-    out.append("null answered")
-except OSError as e:
-    out.append("null errno %d" % e.errno)
-print(" ".join(out))
-)";
-
-std::string hostLines(SimDevice &d, const std::vector<std::string> &ops = {}) {
-    std::vector<std::string> args = {"host", "--", kPython, "-c", kLinesScript};
-    args.insert(args.end(), ops.begin(), ops.end());
-    return d.sim(args);
-}
-
-using IoctlFn = int (*)(int, unsigned long, ...);
-
-int unixConnect(const std::string &path) {
-    int fd = socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    struct sockaddr_un a = {};
-    a.sun_family = AF_UNIX;
-    snprintf(a.sun_path, sizeof a.sun_path, "%s", path.c_str());
-    if (fd >= 0 && connect(fd, reinterpret_cast<struct sockaddr *>(&a), sizeof a) == 0) return fd;
-    if (fd >= 0) close(fd);
-    return -1;
-}
 
 int tcpConnect(int port) {
     int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
@@ -94,66 +45,78 @@ bool closedWithin(int fd, int ms) {
     return poll(&p, 1, ms) == 1 && read(fd, &c, 1) == 0;
 }
 
+// Gone, or a zombie that its new parent has not reaped yet.
 bool ended(pid_t pid) {
-    std::ifstream in("/proc/" + std::to_string(pid) + "/stat");
-    std::stringstream ss;
-    ss << in.rdbuf();
-    std::string stat = ss.str();
+    std::string stat = sim::readFileOr("/proc/" + std::to_string(pid) + "/stat");
     size_t paren = stat.rfind(')');
     return stat.empty() || (paren != std::string::npos && stat.compare(paren + 1, 3, " Z ") == 0);
 }
 
 }  // namespace
 
-TEST(SimHostTools, FreshRootHasDataProdAndStartWaitsUntilThePeerAccepts) {
+// A stopped peer leaves its socket file behind; `start` returns only once a
+// connect succeeds, so the very first connect after it does.
+TEST(SimHostTools, StartReturnsOnceThePeerAccepts) {
     SimDevice d;
     ASSERT_TRUE(d.started()) << d.upOutput();
-    EXPECT_EQ("\r\nOK\r\n", d.at("AT*CIT_WCITF", true)) << "the CIT result folder exists on a fresh device";
-    EXPECT_EQ("x0000001", d.readFile("/data/prod/citf"));
-
-    // A stopped peer leaves its socket file behind; `start` returns only once a
-    // connect succeeds, so the very first connect after it does.
-    for (const char *peer : {"audio", "generic", "radio"}) {
-        SCOPED_TRACE(peer);
-        std::string path = d.root() + (std::string(peer) == "audio"     ? "/dev/socket/tolk-audio"
-                                       : std::string(peer) == "generic" ? "/dev/socket/tolk-service"
-                                                                        : "/dev/hwbinder/radio.slot1");
+    const struct {
+        const char *peer, *socket;
+    } peers[] = {{"audio", "/dev/socket/tolk-audio"},
+                 {"generic", "/dev/socket/tolk-service"},
+                 {"radio", "/dev/hwbinder/radio.slot1"}};
+    for (const auto &p : peers) {
         int status = -1;
-        d.sim({"stop", peer}, &status);
-        ASSERT_EQ(0, status);
-        d.sim({"start", peer}, &status);
-        ASSERT_EQ(0, status);
-        int fd = unixConnect(path);
-        EXPECT_GE(fd, 0) << "connect right after start: " << strerror(errno);
+        d.sim({"stop", p.peer}, &status);
+        ASSERT_EQ(0, status) << p.peer;
+        d.sim({"start", p.peer}, &status);
+        ASSERT_EQ(0, status) << p.peer;
+        int fd = sim::connectUnix(d.root() + p.socket);
+        EXPECT_GE(fd, 0) << p.peer << ": connect right after start: " << strerror(errno);
         if (fd >= 0) close(fd);
     }
 }
 
-TEST(SimHostTools, HostRunnerGivesTheHostPortModemLines) {
+// The interposer `tolk-sim host` preloads, called as a host program calls ioctl:
+// DTR and RTS as last set, by any descriptor or program; DSR, CTS and CD follow
+// the cable, TIOCMIWAIT wakes on their change and TIOCGICOUNT counts it.
+TEST(SimHostTools, HostPortHasTheModemLinesOfAUsbAcmPort) {
     SimDevice d;
     ASSERT_TRUE(d.started()) << d.upOutput();
-    if (access(kPython, X_OK) != 0) GTEST_SKIP() << kPython << " is missing: the host runner is not tested";
-    EXPECT_EQ("DRdcC dcC RdcC DdcC 921600 null errno 25\n",
-              hostLines(d, {"TIOCMBIC=TIOCM_DTR|TIOCM_RTS", "TIOCMBIS=TIOCM_RTS", "TIOCMSET=TIOCM_DTR"}))
-        << "DTR and RTS as set, DSR CTS CD with the cable in, line settings taken, other descriptors untouched";
-    EXPECT_EQ("DdcC 921600 null errno 25\n", hostLines(d)) << "the port keeps its lines for the next program";
-
-    // The same interposer called directly, as a C program would call ioctl.
     std::string lib = d.sim({"host", "--", "/bin/sh", "-c", "printf %s \"$LD_PRELOAD\""});
     lib = lib.substr(0, lib.find(' '));  // the runner puts its library first
     void *shim = dlopen(lib.c_str(), RTLD_NOW | RTLD_LOCAL);
     ASSERT_NE(nullptr, shim) << lib << ": " << dlerror();
-    IoctlFn acmIoctl = reinterpret_cast<IoctlFn>(dlsym(shim, "ioctl"));
+    auto acmIoctl = reinterpret_cast<int (*)(int, unsigned long, ...)>(dlsym(shim, "ioctl"));
     ASSERT_NE(nullptr, acmIoctl);
     setenv("TOLK_ACM_TTY", (d.root() + "/host/ttyACM0").c_str(), 1);
     setenv("TOLK_ACM_LINES", (d.root() + "/run/acm.lines").c_str(), 1);
     int port = d.openSerial();
     ASSERT_GE(port, 0);
-    auto lines = [&]() {
+    auto lines = [&](int fd) {
         int v = -1;
-        EXPECT_EQ(0, acmIoctl(port, TIOCMGET, &v));
-        return v & (TIOCM_DSR | TIOCM_CTS | TIOCM_CD);
+        EXPECT_EQ(0, acmIoctl(fd, TIOCMGET, &v));
+        return v;
     };
+    const int kCable = TIOCM_DSR | TIOCM_CTS | TIOCM_CD;
+    EXPECT_EQ(TIOCM_DTR | TIOCM_RTS | kCable, lines(port)) << "raised at up, cable in";
+    const struct {
+        unsigned long request;
+        int bits, lines;
+    } sets[] = {{TIOCMBIC, TIOCM_DTR | TIOCM_RTS, kCable},
+                {TIOCMBIS, TIOCM_RTS | TIOCM_RI, TIOCM_RTS | kCable},  // RI is not the host's to set
+                {TIOCMSET, TIOCM_DTR, TIOCM_DTR | kCable}};
+    for (const auto &s : sets) {
+        int bits = s.bits;
+        EXPECT_EQ(0, acmIoctl(port, s.request, &bits));
+        EXPECT_EQ(s.lines, lines(port)) << s.request;
+    }
+    int next = d.openSerial();
+    EXPECT_EQ(TIOCM_DTR | kCable, lines(next)) << "the next opener finds them as they were left";
+    close(next);
+    int v = 0, other = open("/dev/null", O_RDWR | O_CLOEXEC);
+    EXPECT_EQ(-1, acmIoctl(other, TIOCMGET, &v)) << "other descriptors go to the kernel";
+    close(other);
+
     auto dcd = [&]() {
         struct serial_icounter_struct ic = {};
         EXPECT_EQ(0, acmIoctl(port, TIOCGICOUNT, &ic));
@@ -183,7 +146,7 @@ TEST(SimHostTools, HostRunnerGivesTheHostPortModemLines) {
             ADD_FAILURE() << "TIOCMIWAIT did not wake";
         }
         EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0);
-        EXPECT_EQ(cable.in ? TIOCM_DSR | TIOCM_CTS | TIOCM_CD : 0, lines());
+        EXPECT_EQ(cable.in ? kCable : 0, lines(port) & kCable);
         EXPECT_EQ(before + cable.transitions, dcd());
     }
     close(port);
