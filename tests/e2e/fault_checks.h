@@ -68,7 +68,7 @@ private:
 // How often needle occurs in text (requests in a peer's journal).
 inline int countOf(const std::string &text, const std::string &needle) {
     int n = 0;
-    for (size_t pos = text.find(needle); pos != std::string::npos; pos = text.find(needle, pos + needle.size())) n++;
+    for (size_t pos = 0; (pos = text.find(needle, pos)) != std::string::npos; pos += needle.size()) n++;
     return n;
 }
 

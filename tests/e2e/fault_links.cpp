@@ -31,7 +31,7 @@ TEST(FaultLinks, CableReplugsDuringTrafficThenUnplugged) {
         HostLink adb(d, true);
         while (adb.fd() >= 0 && !stop) {
             std::string got = adb.ask("AT+CSDF?");
-            EXPECT_EQ(visible(kCsdfAnswer), visible(got)) << "the adb link is not touched by the serial port's loss";
+            EXPECT_EQ(visible(kCsdfAnswer), visible(got)) << "the serial port's loss touches the adb link";
             answered += got == kCsdfAnswer;
         }
     });
@@ -96,7 +96,7 @@ TEST(FaultLinks, AdbConnectionsDroppedAndRacing) {
             if (fd < 0) continue;
             writeAll(fd, line);
             std::string got = readUntil(fd, "OK\r\n", 1000);  // or the end of a replaced connection
-            EXPECT_TRUE(got == answer || got.empty()) << "host sent " << visible(line) << " got " << visible(got);
+            EXPECT_TRUE(got == answer || got.empty()) << visible(line) << " got " << visible(got);
             complete += got == answer;
             close(fd);
         }
