@@ -184,16 +184,14 @@ using SmsMergeTest = HostLinks;
 TEST_F(SmsMergeTest, MergedCommandNeverOutgrowsTheBuffer) {
     // Holds cmd in cmdBuf as routing leaves it and tries to start merging.
     auto startMerge = [](const std::string &cmd) {
-        memset(gSerialDevice.cmdBuf, 0, sizeof(gSerialDevice.cmdBuf));
-        memcpy(gSerialDevice.cmdBuf, cmd.data(), cmd.size());
-        gSerialDevice.currDevice = DEVICE_SERIAL;
+        snprintf(gSerialDevice.cmdBuf, sizeof(gSerialDevice.cmdBuf), "%s", cmd.c_str());
         return startMergeMsgCmdInputIfNeed(&gSerialDevice, gSerialDevice.cmdBuf) != 0;
     };
-    auto textLine = [](const std::string &text) {
-        static char lineBuf[DATA_BUF_SIZE];
-        memset(lineBuf, 0, sizeof(lineBuf));
-        memcpy(lineBuf, text.data(), text.size());
-        return std::string(handleMsgTextLine(&gSerialDevice, lineBuf, (int)text.size()));
+    // One text line in a line buffer of the reader's size, zero-filled behind it.
+    auto textLine = [](std::string text) {
+        const int n = (int)text.size();
+        text.resize(DATA_BUF_SIZE);
+        return std::string(handleMsgTextLine(&gSerialDevice, &text[0], n));
     };
     std::string fits(6000, 'a');
     ASSERT_TRUE(isNeedMergeMsgCmdInput = startMerge("AT+CMGS=23"));

@@ -139,13 +139,12 @@ TEST_F(ResponseWriterTest, FramesAnswersOnce) {
         {"\r\n\r\nX\r\n\r\n", "\r\n\r\nX\r\n\r\n"},  // one CR LF off each end only
         {"X\r\n", "\r\nX\r\n"},
         {"\n\r", "\r\n\n\r\r\n"},
-        // A counted NUL defeats the tail test; text ends at its first NUL.
-        {std::string("ERROR:No Modem", 15), "\r\nERROR:No Modem\r\n"},
-        {std::string("\r\n> ", 5), "\r\n> \r\n"},
+        // Text ends at its first NUL (a counted NUL after the text: "ERROR:No Modem"
+        // in modem.tx, the SMS prompt in sms.tx).
         {std::string("AB\0CD\r\n", 7), "\r\nAB\r\n"},
         {"", "\r\n\r\n"},
-        // Audio answers pass raw; their prefixes count within the length only, and case-exactly.
-        {std::string("AUD+VOL\r\n\0\x01", 11), std::string("AUD+VOL\r\n\0\x01", 11)},
+        // Audio answers pass raw (AUD: audio.tx); their prefixes count within the
+        // length only, and case-exactly.
         {std::string("mm\0\r\nOK\r\n", 9), std::string("mm\0\r\nOK\r\n", 9)},
         {"Mm", "\r\nMm\r\n"},
     };
