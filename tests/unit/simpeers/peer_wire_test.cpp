@@ -1,12 +1,16 @@
 // The radio service as the daemon meets it: a real process on real sockets under
 // a throw-away root, in what the end-to-end tests cannot make it do: stay silent
 // before REGISTER, refuse a request with its own serial, and keep answers in
-// request order behind a slow or held one. Its journal, scripts and unsolicited
-// output are checked by the transcripts.
+// request order behind a slow or held one. Then the daemon's HIDL proxy against
+// it: callbacks in the order the service sent them, all on one runtime thread
+// that is not the caller's (called back on the caller's thread, the HAL bridge's
+// locking would go untested), and one death notice. Its journal, scripts and
+// unsolicited output are checked by the transcripts.
 #include "../../../sim/modem_script.h"
 #include "../../../sim/peers.h"
 
 #include <tolk_platform/radio_wire.h>
+#include <vendor/orvane/hardware/radio/2.0/IRadio.h>
 
 #include <gtest/gtest.h>
 
@@ -18,7 +22,16 @@
 #include <sys/wait.h>
 #include <unistd.h>
 
+#include <mutex>
+#include <thread>
+
 using namespace tolksim;
+using android::sp;
+using android::wp;
+using android::hidl::base::V1_0::IBase;
+using namespace android::hardware;
+using namespace android::hardware::radio::V1_0;
+using namespace vendor::orvane::hardware::radio::V2_0;
 
 namespace {
 
@@ -29,10 +42,16 @@ public:
         if (pid_ == 0) _exit(run_radio_peer(root_.path(), {}));
     }
     ~Peer() {
+        if (pid_ > 0) {
+            EXPECT_EQ(0, stop()) << "the service ends cleanly at SIGTERM";
+        }
+    }
+    int stop() {
         kill(pid_, SIGTERM);
         int status = 0;
         waitpid(pid_, &status, 0);
-        EXPECT_TRUE(WIFEXITED(status) && WEXITSTATUS(status) == 0) << "the service ends cleanly at SIGTERM";
+        pid_ = -1;
+        return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
     }
     TestRoot root_;  // removed with the peer; declared first, made before the fork
 
@@ -52,6 +71,33 @@ std::string recvFrame(int fd, RadioWireHeader *h, int ms = 2000) {
     if (poll(&p, 1, ms) <= 0 || radio_wire_recv(fd, h, buf, sizeof buf) != 0) return "<none>";
     return std::string(buf, h->length);
 }
+
+// Every callback of a proxy ("R:", "I:", "D:" and its text) with the thread it ran on.
+struct Recorder : ITolkResponse, ITolkIndication, hidl_death_recipient {
+    std::mutex mutex;
+    std::vector<std::string> events;
+    std::vector<std::thread::id> threads;
+
+    void add(const std::string &e) {
+        std::lock_guard<std::mutex> lock(mutex);
+        events.push_back(e);
+        threads.push_back(std::this_thread::get_id());
+    }
+    std::vector<std::string> seen() {
+        std::lock_guard<std::mutex> lock(mutex);
+        return events;
+    }
+    static std::string text(const hidl_vec<uint8_t> &v) { return std::string(v.data(), v.data() + v.size()); }
+    Return<void> sendTolkResponse(const RadioResponseInfo &, const hidl_vec<uint8_t> &data) override {
+        add("R:" + text(data));
+        return Void();
+    }
+    Return<void> tolkInd(RadioIndicationType, const hidl_vec<uint8_t> &data) override {
+        add("I:" + text(data));
+        return Void();
+    }
+    void serviceDied(uint64_t cookie, const wp<IBase> &) override { add("D:" + std::to_string(cookie)); }
+};
 
 }  // namespace
 
@@ -90,4 +136,40 @@ TEST(RadioPeer, SilentBeforeRegisterRefusesWithTheSerialAndAnswersInRequestOrder
     EXPECT_EQ(recvFrame(fd, &h), "\r\n+HELD: 1\r\n\r\nOK\r\n");
     EXPECT_EQ(recvFrame(fd, &h), "\r\n350000000000001\r\n\r\nOK\r\n");
     close(fd);
+}
+
+TEST(RadioPeer, ProxyCallbacksInOrderOnOneRuntimeThreadThenOneDeathNotice) {
+    Peer peer;
+    std::string script;
+    std::vector<std::string> expected = {"I:U"};
+    for (int i = 0; i < 40; i++) {
+        script += "AT+L" + std::to_string(i) + " => L" + std::to_string(i) + "\n";
+        expected.push_back("R:L" + std::to_string(i));
+    }
+    peer.root_.write("/sim/radio/script", script);
+    sp<IRadio> radio;
+    ASSERT_TRUE(eventually([&] { return (radio = IRadio::getService("slot1", false)) != nullptr; }));
+    auto request = [&](const std::string &line) {
+        std::string bytes = line + std::string(1, '\0');
+        hidl_vec<uint8_t> data(reinterpret_cast<const uint8_t *>(bytes.data()), bytes.size());
+        return radio->sendTolkRequest(-1, data).isOk();
+    };
+    sp<Recorder> rec = new Recorder;
+    ASSERT_TRUE(radio->registerTolkCallbacks(rec, rec).isOk());
+    ASSERT_TRUE(radio->linkToDeath(rec, 7).isOk());
+    ASSERT_TRUE(eventually([&] { return send_radio_urc(peer.root_.path(), 1, "U") == 0; }));
+    for (int i = 0; i < 40; i++) ASSERT_TRUE(request("AT+L" + std::to_string(i)));
+    ASSERT_TRUE(eventually([&] { return rec->seen().size() >= expected.size(); }));
+
+    EXPECT_EQ(0, peer.stop());
+    expected.push_back("D:7");
+    ASSERT_TRUE(eventually([&] { return rec->seen().size() >= expected.size(); }));
+    // SIGPIPE keeps its default action here: a send that raised it would end the test.
+    EXPECT_FALSE(request("AT"));
+    EXPECT_EQ(expected, rec->seen()) << "one notice, after every callback";
+    std::lock_guard<std::mutex> hold(rec->mutex);
+    for (const auto &id : rec->threads) {
+        EXPECT_NE(std::this_thread::get_id(), id);
+        EXPECT_EQ(rec->threads[0], id);
+    }
 }
