@@ -239,10 +239,11 @@ TEST_F(MmiQueue, SurplusModemOutputDoesNotStrandLaterCommands) {
 TEST_F(MmiQueue, FullQueueStoresNothingAndKeepsTextsInStep) {
     for (int i = 0; i < MMI_QUEUE_SIZE; i++) mmiCommand(("CMD" + std::to_string(i)).c_str());
 
-    // The eleventh: the dispatcher keeps its text out of the ring when the entry is
-    // taken, so only the pending flag arrives here. Were an entry stored, it would
-    // take the first command's place and shift every answer below.
-    gMmiCmdSeq.cusMmiCmdPending = 1;
+    // The eleventh, through the dispatcher: with every entry taken it stores no text
+    // and the enqueue no entry. Either would take the first command's place and
+    // shift every answer below.
+    EXPECT_EQ(RIL_TYPE, process_cmd_line("AT+CPIN=1"));
+    EXPECT_EQ(1, gMmiCmdSeq.cusMmiCmdPending) << "flagged, so that the enqueue reports the full queue";
     mmiCmdSeqEnQueue();
     EXPECT_EQ(11, gMmiCmdSeq.idx);
     EXPECT_EQ(0, gMmiCmdSeq.cusMmiCmdPending);
