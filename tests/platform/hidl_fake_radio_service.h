@@ -30,35 +30,30 @@ class FakeRadioService {
 public:
     // socketPath: host path of the instance's socket (TestRoot::at of the device path).
     explicit FakeRadioService(const std::string &socketPath)
-        : listenFd_(tolk_local_server(socketPath.c_str(), ANDROID_SOCKET_NAMESPACE_FILESYSTEM, SOCK_STREAM, 4)) {}
+        : listenFd_(tolk_local_server(socketPath.c_str(), ANDROID_SOCKET_NAMESPACE_FILESYSTEM, SOCK_STREAM,
+                                      kBacklog)) {}
     ~FakeRadioService() {
         for (int fd : clients_) {
             if (fd >= 0) close(fd);
         }
         if (listenFd_ >= 0) close(listenFd_);
     }
-    FakeRadioService(const FakeRadioService &) = delete;
-    FakeRadioService &operator=(const FakeRadioService &) = delete;
 
     bool ok() const { return listenFd_ >= 0; }
     // Ends every client connection, as a dying service would.
     void dropConnections() {
         takeArrivals();
-        for (int fd : clients_) {
-            if (fd >= 0) shutdown(fd, SHUT_RDWR);
-        }
+        for (int fd : clients_) shutdown(fd, SHUT_RDWR);  // a gone client's -1 is refused harmlessly
     }
-    bool waitFrames(size_t count) {
-        return eventually([&] { return takeArrivals(), frames_.size() >= count; });
-    }
+    bool waitFrames(size_t n) { return eventually([&] { return takeArrivals(), frames_.size() >= n; }); }
     const std::vector<FakeRadioFrame> &frames() { return takeArrivals(), frames_; }
     int connections() { return takeArrivals(), static_cast<int>(clients_.size()); }
     // Sends to the newest client connection; false when there is none.
     bool send(uint32_t type, const std::string &payload) {
         takeArrivals();
-        return !clients_.empty() && clients_.back() >= 0 &&
-               radio_wire_send(clients_.back(), type, -1, 0, payload.data(), static_cast<uint32_t>(payload.size())) ==
-                   0;
+        if (clients_.empty() || clients_.back() < 0) return false;
+        uint32_t length = static_cast<uint32_t>(payload.size());
+        return radio_wire_send(clients_.back(), type, -1, 0, payload.data(), length) == 0;
     }
     bool respond(const std::string &payload) { return send(RADIO_WIRE_RESPONSE, payload); }
     bool indicate(const std::string &payload) { return send(RADIO_WIRE_INDICATION, payload); }
@@ -89,6 +84,7 @@ private:
         }
     }
 
+    static const int kBacklog = 4;
     int listenFd_;
     std::vector<int> clients_;
     std::vector<FakeRadioFrame> frames_;
