@@ -12,36 +12,25 @@
 #include <unistd.h>
 
 #include <string>
+#include <utility>
 
 #include "test_root.h"
 
-namespace {
-
-std::string resolved(const char *path) {
-    char buf[4096];
-    const char *r = tolk_device_path(path, buf, sizeof(buf));
-    return r != nullptr ? std::string(r) : std::string("<null>");
-}
-
-}  // namespace
-
-TEST(DeviceRoot, PathsResolveUnderTheRootOnce) {
+TEST(DeviceRoot, PathsResolveUnderTheRootOnceAndOpenAndFopenReachIt) {
     TestRoot root;
-    EXPECT_EQ(resolved("/dev/ttyGS0"), root.path() + "/dev/ttyGS0");
-    EXPECT_EQ(resolved("relative/file"), "relative/file");
-    // Already resolved: not prefixed twice. A sibling whose name merely starts
-    // like the root is not under it.
-    EXPECT_EQ(resolved(root.at("/data/prod/citf").c_str()), root.at("/data/prod/citf"));
-    std::string sibling = root.path() + "x/file";
-    EXPECT_EQ(resolved(sibling.c_str()), root.path() + sibling);
-    char small[8];
+    const std::string sibling = root.path() + "x/file";  // starts like the root, is not under it
+    const std::pair<std::string, std::string> cases[] = {
+        {"/dev/ttyGS0", root.at("/dev/ttyGS0")},
+        {"relative/file", "relative/file"},
+        {root.at("/data/prod/citf"), root.at("/data/prod/citf")},  // not prefixed twice
+        {sibling, root.path() + sibling},
+    };
+    char buf[4096], small[8];
+    for (const auto &c : cases) {
+        EXPECT_STREQ(c.second.c_str(), tolk_device_path(c.first.c_str(), buf, sizeof(buf))) << c.first;
+    }
     EXPECT_EQ(tolk_device_path("/dev/ttyGS0", small, sizeof(small)), nullptr);
-    unsetenv("TOLKD_ROOT");
-    EXPECT_EQ(resolved("/sys/class"), "/sys/class");
-}
 
-TEST(DeviceRoot, OpenAndFopenReachTheRoot) {
-    TestRoot root;
     root.write("/sys/boot_mode", "5\n");
     FILE *f = fopen("/sys/boot_mode", "r");
     ASSERT_NE(f, nullptr);
@@ -55,8 +44,12 @@ TEST(DeviceRoot, OpenAndFopenReachTheRoot) {
     ASSERT_EQ(stat(root.at("/sys/new").c_str(), &st), 0);
     EXPECT_EQ(st.st_mode & 0777, 0600u);
 
-    // The root is looked up at the moment of the open.
-    TestRoot other;
-    EXPECT_LT(open("/sys/new", O_RDONLY), 0);
-    EXPECT_EQ(fopen("/sys/boot_mode", "r"), nullptr);
+    // The root is looked up at the moment of the call.
+    {
+        TestRoot other;
+        EXPECT_LT(open("/sys/new", O_RDONLY), 0);
+        EXPECT_EQ(fopen("/sys/boot_mode", "r"), nullptr);
+    }
+    unsetenv("TOLKD_ROOT");
+    EXPECT_STREQ("/sys/class", tolk_device_path("/sys/class", buf, sizeof(buf)));
 }
