@@ -1,14 +1,12 @@
 // The simulator's host-side promises that tests and host tools lean on: `start`
 // returns once the peer accepts, the host port has the modem lines of a USB ACM
-// port, the forwarder serves the adb link on a loopback TCP port, and slot 1 can
-// be a modem on a serial device. Real host programs through `tolk-sim host` are
-// in host_clients.cpp.
+// port, and the forwarder serves the adb link on a loopback TCP port. Real host
+// programs through `tolk-sim host` are in host_clients.cpp.
 #include <arpa/inet.h>
 #include <dlfcn.h>
 #include <linux/serial.h>
 #include <netinet/in.h>
 #include <poll.h>
-#include <pty.h>
 #include <signal.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
@@ -173,29 +171,4 @@ TEST(SimHostTools, ForwarderRelaysTheAdbLinkOverLoopbackTcp) {
 
     kill(pid, SIGTERM);
     EXPECT_TRUE(eventually([&] { return ended(pid); }, 3000)) << "the forwarder ends at SIGTERM";
-}
-
-// The modem gets the command line with the CR it waits for, and whatever it says
-// reaches the host, unsolicited lines included; the other slots stay simulated.
-TEST(SimHostTools, SlotOneCanBeAModemOnASerialDevice) {
-    int master = -1, slave = -1;
-    char name[64];
-    ASSERT_EQ(openpty(&master, &slave, name, nullptr, nullptr), 0);
-    SimDevice d({"--prop", "persist.service.tolk.usermode=1", "--modem-tty", name});
-    ASSERT_TRUE(d.started()) << d.upOutput();
-    int adb = d.connectAdb();
-    ASSERT_GE(adb, 0);
-    writeAll(adb, "AT+CSQ\r");
-    EXPECT_EQ(visible("AT+CSQ\r"), visible(readUntil(master, "\r", 3000)));
-    writeAll(master, "\r\n+CSQ: 9,99\r\n\r\nOK\r\n");
-    EXPECT_EQ(visible("\r\n+CSQ: 9,99\r\n\r\nOK\r\n"), visible(readUntil(adb, "OK\r\n", 3000)));
-    writeAll(master, "\r\nRING\r\n");
-    EXPECT_EQ(visible("\r\nRING\r\n"), visible(readUntil(adb, "RING\r\n", 3000)));
-    d.setprop("persist.service.tolk.sim", "1");
-    writeAll(adb, "AT+CGSN\r");
-    EXPECT_EQ(visible("\r\n350000000000002\r\n\r\nOK\r\n"), visible(readUntil(adb, "OK\r\n", 3000)));
-    EXPECT_EQ("-1\tAT+CSQ\\x00\n", d.readFile("/journal/radio.slot1.log"));
-    close(adb);
-    close(master);
-    close(slave);
 }
