@@ -5,56 +5,45 @@
 #include <gtest/gtest.h>
 
 #include <stdlib.h>
-#include <string.h>
 
+#include <functional>
 #include <string>
 
 #include "test_root.h"
-
-namespace {
-
-bool shown(const TestRoot &root, const std::string &text) {
-    return root.read("/log/tolkd.log").find(text) != std::string::npos;
-}
-
-}  // namespace
 
 TEST(LogFilterEnv, EveryChangeOfTheFilterVariableIsSeen) {
     unsetenv("TOLKD_LOG");
     unsetenv("TOLKD_LOG_STDERR");
     unsetenv("ANDROID_LOG_TAGS");
     TestRoot root;
-
-    __android_log_print(ANDROID_LOG_DEBUG, "TOLKD", "d-default");
-    // Added while absent, then replaced, then removed.
-    setenv("ANDROID_LOG_TAGS", "*:d", 1);
-    __android_log_print(ANDROID_LOG_DEBUG, "TOLKD", "d-added");
-    setenv("ANDROID_LOG_TAGS", "*:e", 1);
-    __android_log_print(ANDROID_LOG_WARN, "TOLKD", "w-replaced");
-    unsetenv("ANDROID_LOG_TAGS");
-    __android_log_print(ANDROID_LOG_INFO, "TOLKD", "i-removed");
-
-    // Another variable removed and the filter added in its place: same count.
-    setenv("TOLK_LOG_FILTER_TEST_OTHER", "1", 1);
-    __android_log_print(ANDROID_LOG_DEBUG, "TOLKD", "d-other");
-    unsetenv("TOLK_LOG_FILTER_TEST_OTHER");
-    setenv("ANDROID_LOG_TAGS", "*:v", 1);
-    __android_log_print(ANDROID_LOG_DEBUG, "TOLKD", "d-swapped");
-
-    // A putenv string edited in place.
     static char entry[] = "ANDROID_LOG_TAGS=*:s";
-    putenv(entry);
-    __android_log_print(ANDROID_LOG_ERROR, "TOLKD", "e-silent");
-    memcpy(entry + strlen("ANDROID_LOG_TAGS=*:"), "v", 1);
-    __android_log_print(ANDROID_LOG_DEBUG, "TOLKD", "d-edited");
+    const struct {
+        std::function<void()> change;
+        int priority;
+        bool shown;
+    } steps[] = {
+        {[] {}, ANDROID_LOG_DEBUG, false},  // the default is info
+        {[] { setenv("ANDROID_LOG_TAGS", "*:d", 1); }, ANDROID_LOG_DEBUG, true},  // added
+        {[] { setenv("ANDROID_LOG_TAGS", "*:e", 1); }, ANDROID_LOG_WARN, false},  // replaced
+        {[] { unsetenv("ANDROID_LOG_TAGS"); }, ANDROID_LOG_INFO, true},            // removed
+        {[] { setenv("TOLK_LOG_FILTER_TEST_OTHER", "1", 1); }, ANDROID_LOG_DEBUG, false},
+        // Another variable removed and the filter added in its place: the same count.
+        {[] {
+             unsetenv("TOLK_LOG_FILTER_TEST_OTHER");
+             setenv("ANDROID_LOG_TAGS", "*:v", 1);
+         },
+         ANDROID_LOG_DEBUG, true},
+        {[] { putenv(entry); }, ANDROID_LOG_ERROR, false},
+        {[] { entry[sizeof(entry) - 2] = 'v'; }, ANDROID_LOG_DEBUG, true},  // the putenv string edited in place
+    };
+    const int count = sizeof(steps) / sizeof(steps[0]);
+    for (int i = 0; i < count; i++) {
+        steps[i].change();
+        __android_log_print(steps[i].priority, "TOLKD", "step %d.", i);
+    }
     unsetenv("ANDROID_LOG_TAGS");
-
-    EXPECT_FALSE(shown(root, "d-default"));
-    EXPECT_TRUE(shown(root, "d-added"));
-    EXPECT_FALSE(shown(root, "w-replaced"));
-    EXPECT_TRUE(shown(root, "i-removed"));
-    EXPECT_FALSE(shown(root, "d-other"));
-    EXPECT_TRUE(shown(root, "d-swapped"));
-    EXPECT_FALSE(shown(root, "e-silent"));
-    EXPECT_TRUE(shown(root, "d-edited"));
+    const std::string log = root.read("/log/tolkd.log");
+    for (int i = 0; i < count; i++) {
+        EXPECT_EQ(steps[i].shown, log.find("step " + std::to_string(i) + ".") != std::string::npos) << i;
+    }
 }

@@ -5,12 +5,12 @@
 
 #include <gtest/gtest.h>
 
+#include <stdio.h>
 #include <stdlib.h>
 #include <sys/syscall.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
-#include <regex>
 #include <sstream>
 #include <string>
 #include <thread>
@@ -19,15 +19,19 @@
 
 namespace {
 
-// (pid, tid) of the line whose message is text; (-1, -1) when there is none.
-std::pair<long, long> idsOf(const std::string &log, const std::string &text) {
+std::string ids(long pid, long tid) { return std::to_string(pid) + " " + std::to_string(tid); }
+
+// "pid tid" of the line whose message is text ("12-06 07:45:15.123  4711  4712 I TOLKD: text").
+std::string idsOf(const std::string &log, const std::string &text) {
     std::istringstream in(log);
-    std::regex head(R"(^\d\d-\d\d \d\d:\d\d:\d\d\.\d\d\d +(\d+) +(\d+) [VDIWEF] \w+: (.*)$)");
     for (std::string line; std::getline(in, line);) {
-        std::smatch m;
-        if (std::regex_match(line, m, head) && m[3] == text) return {std::stol(m[1]), std::stol(m[2])};
+        long pid = 0, tid = 0;
+        int end = 0;
+        if (sscanf(line.c_str(), "%*s %*s %ld %ld %*c TOLKD: %n", &pid, &tid, &end) == 2 && end > 0 &&
+            line.substr(end) == text)
+            return ids(pid, tid);
     }
-    return {-1, -1};
+    return "none";
 }
 
 }  // namespace
@@ -37,31 +41,25 @@ TEST(LogIds, HeadersNameTheLoggingProcessAndThread) {
     unsetenv("TOLKD_LOG_STDERR");
     unsetenv("ANDROID_LOG_TAGS");
     TestRoot root;
-    const long self = getpid();
-    const long mainTid = syscall(SYS_gettid);
+    const long self = getpid(), mainTid = syscall(SYS_gettid);
     __android_log_print(ANDROID_LOG_INFO, "TOLKD", "parent before");
-
     long threadTid = 0;
-    std::thread t([&] {
+    std::thread([&] {
         threadTid = syscall(SYS_gettid);
         __android_log_print(ANDROID_LOG_INFO, "TOLKD", "from a thread");
-    });
-    t.join();
-
+    }).join();
     pid_t child = fork();
     ASSERT_GE(child, 0);
     if (child == 0) {
         __android_log_print(ANDROID_LOG_INFO, "TOLKD", "from the child");
         _exit(0);
     }
-    int status = 0;
-    ASSERT_EQ(waitpid(child, &status, 0), child);
+    ASSERT_EQ(waitpid(child, nullptr, 0), child);
     __android_log_print(ANDROID_LOG_INFO, "TOLKD", "parent after");
 
-    std::string log = root.read("/log/tolkd.log");
-    EXPECT_EQ(idsOf(log, "parent before"), std::make_pair(self, mainTid)) << log;
-    EXPECT_EQ(idsOf(log, "from a thread"), std::make_pair(self, threadTid)) << log;
-    EXPECT_EQ(idsOf(log, "from the child"), std::make_pair(static_cast<long>(child), static_cast<long>(child)))
-        << log;
-    EXPECT_EQ(idsOf(log, "parent after"), std::make_pair(self, mainTid)) << log;
+    const std::string log = root.read("/log/tolkd.log");
+    EXPECT_EQ(ids(self, mainTid), idsOf(log, "parent before")) << log;
+    EXPECT_EQ(ids(self, threadTid), idsOf(log, "from a thread")) << log;
+    EXPECT_EQ(ids(child, child), idsOf(log, "from the child")) << log;
+    EXPECT_EQ(ids(self, mainTid), idsOf(log, "parent after")) << log;
 }
