@@ -1,6 +1,6 @@
 // The command line reader, SMS text merging and the user-mode gate against real
-// descriptors in every slot the reader watches: a pseudo-terminal in the daemon's
-// canonical mode as the serial port, a socket pair as the accepted adb connection,
+// descriptors in every slot the reader watches: a pseudo-terminal in canonical
+// mode as the serial port, a socket pair as the accepted adb connection,
 // a listening AF_UNIX socket as the control socket, and a modem pair.
 #include <fcntl.h>
 #include <sys/ioctl.h>
@@ -38,9 +38,7 @@ protected:
         struct termios t;
         ASSERT_EQ(0, tcgetattr(slave, &t));
         t.c_iflag = t.c_oflag = 0;
-        t.c_lflag = ICANON | IEXTEN;  // no echo; IEXTEN makes VEOL2 end a line
-        t.c_cc[VEOL] = 0x1A;
-        t.c_cc[VEOL2] = 0x1B;
+        t.c_lflag = ICANON;  // no echo; lines end at LF only (the other line ends: links.tx)
         tcsetattr(slave, TCSANOW, &t);
         gSerialDevice.fd[DEVICE_SERIAL] = slave;
 

@@ -77,11 +77,11 @@ protected:
     }
     std::string hostGets(const char *data, int len) {
         writeDataToSerial(data, len);
-        std::vector<std::string> got;
         static char buf[16384];
-        for (ssize_t n; (n = recv(host_, buf, sizeof(buf), MSG_DONTWAIT)) > 0;) got.emplace_back(buf, n);
-        EXPECT_EQ(1u, got.size());
-        return got.empty() ? "<nothing>" : got[0];
+        const ssize_t n = recv(host_, buf, sizeof(buf), MSG_DONTWAIT);
+        const std::string got = n > 0 ? std::string(buf, n) : "<nothing>";
+        EXPECT_EQ(-1, recv(host_, buf, sizeof(buf), MSG_DONTWAIT)) << "one write, one answer";
+        return got;
     }
     std::string hostGets(const std::string &data) { return hostGets(data.data(), static_cast<int>(data.size())); }
     int host_ = -1;
