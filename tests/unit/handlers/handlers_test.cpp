@@ -1,6 +1,6 @@
 // Local command handlers called the way the dispatcher calls them, where the
 // end-to-end tables cannot reach: the clock's environment, SIM counts other than
-// two, property values past the switches' range and a property store that refuses.
+// two, quoted switch values and a property store that refuses.
 #include <cstdlib>
 #include <ctime>
 #include <filesystem>
