@@ -1,5 +1,5 @@
-// Test helpers: the in-memory state of a freshly started daemon, and a fixture
-// that calls handlers the way the dispatcher does.
+// Test helpers: the in-memory state these tests change, back as in a freshly
+// started daemon, and a fixture that calls handlers the way the dispatcher does.
 #ifndef TOLK_TESTS_DISPATCH_HANDLER_STATE_H
 #define TOLK_TESTS_DISPATCH_HANDLER_STATE_H
 
@@ -14,14 +14,8 @@
 #include "test_root.h"
 
 inline void resetHandlerState() {
-    for (int &v : gCmecConfig) v = 2;
     gVzwTolkCfg = 0;
-    gCsdfMode = 1;
-    gCsdfAuxmode = 1;
     gCclkTz = 65535;
-    wifiEnableState = -1;
-    wifiBand = -1;
-    wifiFrequency = wifiDataRate = wifiTxPower = 0;
     mmiCmdSeqReset();
 }
 
