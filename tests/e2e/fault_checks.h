@@ -1,11 +1,9 @@
-// Checks shared by the fault and soak tests: a host link held open across
-// commands, and, after whatever was done to the device, a daemon that still
-// runs, answers a local command on both host links and holds as many
-// descriptors as before.
+// Checks shared by the fault and soak tests: after whatever was done to the
+// device, the daemon still runs, answers a local command on both host links and
+// holds as many descriptors as before.
 #ifndef TOLK_TESTS_E2E_FAULT_CHECKS_H
 #define TOLK_TESTS_E2E_FAULT_CHECKS_H
 
-#include <poll.h>
 #include <unistd.h>
 
 #include <string>
@@ -19,51 +17,6 @@ namespace fault_checks {
 
 // What a local query answers on a link whose echo is off (adb always).
 const char kCsdfAnswer[] = "\r\n+CSDF: 1,1\n\r\n\r\nOK\r\n";
-
-// One host link kept open; the serial one with its echo switched off.
-class HostLink {
-public:
-    HostLink(SimDevice &d, bool adb) : fd_(adb ? d.connectAdb() : d.openSerial()) {
-        EXPECT_GE(fd_, 0) << (adb ? "adb" : "serial") << " link";
-        if (!adb && fd_ >= 0) writeAll(fd_, "ATE0\r"), readUntil(fd_, "OK\r\n", 3000);
-    }
-    ~HostLink() {
-        if (fd_ >= 0) close(fd_);
-    }
-    HostLink(const HostLink &) = delete;
-    HostLink &operator=(const HostLink &) = delete;
-    int fd() const { return fd_; }
-    // Sends the line with its CR; what arrived once the bytes end in a final
-    // result line ("OK", "ERROR", "ERROR:No Modem"...), or when ms passed quietly.
-    std::string ask(const std::string &line, int ms = 3000) {
-        writeAll(fd_, line + "\r");
-        return answer(ms);
-    }
-    std::string answer(int ms = 3000) {
-        std::string got;
-        char buf[4096];
-        for (struct pollfd p = {fd_, POLLIN, 0}; !finished(got) && poll(&p, 1, ms) == 1;) {
-            ssize_t n = read(fd_, buf, sizeof buf);
-            if (n <= 0) break;
-            got.append(buf, static_cast<size_t>(n));
-        }
-        return got;
-    }
-    // Sends the line; what arrived within ms (an answer that must not come).
-    std::string silent(const std::string &line, int ms = 200) {
-        writeAll(fd_, line + "\r");
-        return readQuiet(fd_, ms, ms);
-    }
-
-private:
-    static bool finished(const std::string &got) {
-        size_t n = got.size(), cut = n > 2 ? got.rfind("\r\n", n - 3) : std::string::npos;
-        if (cut == std::string::npos || got.compare(n - 2, 2, "\r\n") != 0) return false;
-        std::string last = got.substr(cut + 2, n - cut - 4);
-        return last == "OK" || last.compare(0, 5, "ERROR") == 0;
-    }
-    int fd_;
-};
 
 // How often needle occurs in text (requests in a peer's journal).
 inline int countOf(const std::string &text, const std::string &needle) {

@@ -28,9 +28,8 @@ TEST(FaultLinks, CableReplugsDuringTrafficThenUnplugged) {
     std::atomic<bool> stop(false);
     std::atomic<int> answered(0);
     std::thread adbHost([&] {
-        HostLink adb(d, true);
-        while (adb.fd() >= 0 && !stop) {
-            std::string got = adb.ask("AT+CSDF?");
+        while (!stop) {
+            std::string got = d.at("AT+CSDF?", true);
             EXPECT_EQ(visible(kCsdfAnswer), visible(got)) << "the serial port's loss touches the adb link";
             answered += got == kCsdfAnswer;
         }
@@ -57,12 +56,14 @@ TEST(FaultLinks, CableReplugsDuringTrafficThenUnplugged) {
 
     // Losing the cable for good ends the daemon with status 1, an open adb
     // connection or not.
-    HostLink adb(d, true);
-    EXPECT_EQ(visible(kCsdfAnswer), visible(adb.ask("AT+CSDF?")));
+    int held = d.connectAdb();
+    writeAll(held, "AT+CSDF?\r");
+    EXPECT_EQ(visible(kCsdfAnswer), visible(readUntil(held, kCsdfAnswer)));
     simOk(d, {"unplug"});
     EXPECT_EQ(1, d.tolkdExitStatus(5000));
     EXPECT_NE(std::string::npos, d.log().find("FATAL Error in serail read"));
     EXPECT_NE(std::string::npos, d.log().find("The process is terminated due to fatal error"));
+    close(held);
 }
 
 // Connections that say nothing, half a line or a whole one, two hundred times;

@@ -12,7 +12,6 @@ namespace {
 TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
     SimDevice d({"--prop", "persist.service.tolk.usermode=1"});
     ASSERT_TRUE(d.started()) << d.upOutput();
-    HostLink adb(d, true);
     const std::string v91(91, '7'), noModem = "\r\nERROR:No Modem\r\n";
 
     // The SIM choice names a slot; anything else finds no modem, never a wrong slot.
@@ -41,7 +40,7 @@ TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
             SCOPED_TRACE(std::string("sim ") + c.sim + " cdma " + c.cdma);
             d.setprop("persist.service.tolk.sim", c.sim);
             d.setprop("persist.radio.cdma_slot", c.cdma);
-            EXPECT_EQ(visible(c.answer), visible(adb.ask("AT+CGSN")));
+            EXPECT_EQ(visible(c.answer), visible(d.at("AT+CGSN", true)));
         }
         if (pass == 0) fds = settledFds(d);
     }
@@ -49,15 +48,14 @@ TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
 
     // A switch holding a 91-character value or text is reported, not misread.
     d.setprop("persist.service.tolk_urc.enable", v91);
-    EXPECT_EQ("\r\n+EURC:invalid value.\r\n\r\nOK\r\n", adb.ask("AT%EURC?"));
+    EXPECT_EQ("\r\n+EURC:invalid value.\r\n\r\nOK\r\n", d.at("AT%EURC?", true));
     d.setprop("persist.service.tolk_urc.enable", "abc");
-    EXPECT_EQ("\r\n+EURC:0\r\n\r\nOK\r\n", adb.ask("AT%EURC?"));
-    // The longest USB configuration is echoed whole, in the handler's result and the final one.
+    EXPECT_EQ("\r\n+EURC:0\r\n\r\nOK\r\n", d.at("AT%EURC?", true));
+    // The longest USB configuration is echoed whole, in the handler's result and
+    // the final one (maybe in two writes: the query after it gathers both).
     d.setprop("sys.usb.config", std::string(91, 'm'));
-    const std::string usb = "\r\n@USBCONFIG: \"" + std::string(91, 'm') + "\"\r\n\r\nOK\r\n\r\nOK\r\n";
-    writeAll(adb.fd(), "AT@USBCONFIG?\r");
-    EXPECT_EQ(usb, readUntil(adb.fd(), usb, 3000));
-    EXPECT_EQ(visible(kCsdfAnswer), visible(adb.ask("AT+CSDF?")));
+    EXPECT_EQ("\r\n@USBCONFIG: \"" + std::string(91, 'm') + "\"\r\n\r\nOK\r\n\r\nOK\r\n" + kCsdfAnswer,
+              d.at(std::vector<std::string>{"AT@USBCONFIG?", "AT+CSDF?"}, true));
     EXPECT_EQ(fds, settledFds(d, fds));
 }
 

@@ -34,6 +34,14 @@ const struct {
     {"AT+CSDF=1,1", "\r\nOK\r\n", kLocal},
 };
 
+// A host link, closed at the end.
+struct Link {
+    int fd;
+    ~Link() {
+        if (fd >= 0) close(fd);
+    }
+};
+
 // Resident memory of the daemon in kB (VmRSS), once it has settled; -1 when unknown.
 long tolkdRssKb(const SimDevice &d) {
     usleep(100 * 1000);
@@ -46,8 +54,10 @@ long tolkdRssKb(const SimDevice &d) {
 TEST(Soak, MixedTrafficOnBothLinks) {
     SimDevice d({"--prop", "persist.service.tolk.usermode=1"});
     ASSERT_TRUE(d.started()) << d.upOutput();
-    HostLink serial(d, false), adb(d, true);
-    ASSERT_TRUE(serial.fd() >= 0 && adb.fd() >= 0);
+    Link serial{d.openSerial()}, adb{d.connectAdb()};
+    ASSERT_TRUE(serial.fd >= 0 && adb.fd >= 0);
+    writeAll(serial.fd, "ATE0\r");
+    ASSERT_EQ("ATE0\n\r\nOK\r\n", readUntil(serial.fd, "OK\r\n"));
 
     const int errorsAtStart = countOf(d.log(), " E TOLKD");
     const char *env = getenv("TOLK_SOAK_COMMANDS");
@@ -58,7 +68,7 @@ TEST(Soak, MixedTrafficOnBothLinks) {
     auto start = std::chrono::steady_clock::now();
     for (long i = 0; i < total; i++) {
         const auto &c = kMix[i % kMixSize];
-        int fd = i % 50 == 7 ? serial.fd() : adb.fd();
+        int fd = i % 50 == 7 ? serial.fd : adb.fd;
         ASSERT_TRUE(writeAll(fd, std::string(c.line) + "\r"));
         ASSERT_EQ(visible(c.answer), visible(readUntil(fd, c.answer))) << "command " << i << " " << c.line;
         sent[c.target]++;
