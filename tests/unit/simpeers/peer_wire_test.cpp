@@ -26,10 +26,9 @@
 #include <thread>
 
 using namespace tolksim;
-using android::sp;
-using android::wp;
-using android::hidl::base::V1_0::IBase;
+using namespace android;
 using namespace android::hardware;
+using android::hidl::base::V1_0::IBase;
 using namespace android::hardware::radio::V1_0;
 using namespace vendor::orvane::hardware::radio::V2_0;
 
@@ -42,9 +41,7 @@ public:
         if (pid_ == 0) _exit(run_radio_peer(root_.path(), {}));
     }
     ~Peer() {
-        if (pid_ > 0) {
-            EXPECT_EQ(0, stop()) << "the service ends cleanly at SIGTERM";
-        }
+        if (pid_ > 0) stop();
     }
     int stop() {
         kill(pid_, SIGTERM);
@@ -149,9 +146,8 @@ TEST(RadioPeer, ProxyCallbacksInOrderOnOneRuntimeThreadThenOneDeathNotice) {
     peer.root_.write("/sim/radio/script", script);
     sp<IRadio> radio;
     ASSERT_TRUE(eventually([&] { return (radio = IRadio::getService("slot1", false)) != nullptr; }));
-    auto request = [&](const std::string &line) {
-        std::string bytes = line + std::string(1, '\0');
-        hidl_vec<uint8_t> data(reinterpret_cast<const uint8_t *>(bytes.data()), bytes.size());
+    auto request = [&](const std::string &line) {  // sent with its NUL
+        hidl_vec<uint8_t> data(reinterpret_cast<const uint8_t *>(line.c_str()), line.size() + 1);
         return radio->sendTolkRequest(-1, data).isOk();
     };
     sp<Recorder> rec = new Recorder;
@@ -161,7 +157,7 @@ TEST(RadioPeer, ProxyCallbacksInOrderOnOneRuntimeThreadThenOneDeathNotice) {
     for (int i = 0; i < 40; i++) ASSERT_TRUE(request("AT+L" + std::to_string(i)));
     ASSERT_TRUE(eventually([&] { return rec->seen().size() >= expected.size(); }));
 
-    EXPECT_EQ(0, peer.stop());
+    EXPECT_EQ(0, peer.stop()) << "the service ends cleanly at SIGTERM";
     expected.push_back("D:7");
     ASSERT_TRUE(eventually([&] { return rec->seen().size() >= expected.size(); }));
     // SIGPIPE keeps its default action here: a send that raised it would end the test.
