@@ -11,6 +11,7 @@
 #include <algorithm>
 #include <chrono>
 #include <fstream>
+#include <iterator>
 
 #include <gtest/gtest.h>
 
@@ -62,22 +63,20 @@ TEST(Soak, MixedTrafficOnBothLinks) {
     const int errorsAtStart = countOf(d.log(), " E TOLKD");
     const char *env = getenv("TOLK_SOAK_COMMANDS");
     const long total = std::max(2000L, env && *env ? atol(env) : 100000L);
-    const size_t kMixSize = sizeof kMix / sizeof kMix[0];
-    long sent[3] = {0, 0, 0}, urcs = 0, rssAfterWarmup = -1;
+    long sent[3] = {0, 0, 0}, rssAfterWarmup = -1;
     int fdsAfterWarmup = -1;
     auto start = std::chrono::steady_clock::now();
     for (long i = 0; i < total; i++) {
-        const auto &c = kMix[i % kMixSize];
+        const auto &c = kMix[i % std::size(kMix)];
         int fd = i % 50 == 7 ? serial.fd : adb.fd;
         ASSERT_TRUE(writeAll(fd, std::string(c.line) + "\r"));
         ASSERT_EQ(visible(c.answer), visible(readUntil(fd, c.answer))) << "command " << i << " " << c.line;
         sent[c.target]++;
-        // Unsolicited output goes to the link of the last command.
-        if (i % 140 == 1) {  // always after AT+CSQ
+        // Unsolicited output, always after AT+CSQ, goes to the link of the last command.
+        if (i % 140 == 1) {
             std::string text = "\r\n+CREG: " + std::to_string(i % 5) + "\r\n";
             simOk(d, {"urc", visible(text)});
             ASSERT_EQ(visible(text), visible(readUntil(fd, text, 3000))) << "urc after command " << i;
-            urcs++;
         }
         if (i == 999) {
             rssAfterWarmup = tolkdRssKb(d);
@@ -85,13 +84,8 @@ TEST(Soak, MixedTrafficOnBothLinks) {
         }
     }
     long rss = tolkdRssKb(d);
-    double seconds = std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
-    printf("soak: %ld commands (%ld local, %ld modem, %ld generic), %ld unsolicited, %.1f s, "
-           "VmRSS %ld kB after 1000, %ld kB at the end\n",
-           total, sent[kLocal], sent[kModem], sent[kGeneric], urcs,
-           seconds, rssAfterWarmup, rss);
-
-    EXPECT_GT(urcs, 0);
+    printf("soak: %ld commands in %.1f s, VmRSS %ld kB after 1000, %ld kB at the end\n", total,
+           std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count(), rssAfterWarmup, rss);
     EXPECT_EQ(fdsAfterWarmup, d.tolkdFdCount());
     EXPECT_GT(rssAfterWarmup, 0);
     // Under a wrapper (valgrind) the process's memory is mostly the wrapper's own;
