@@ -62,11 +62,8 @@ TEST(SimHostTools, StartReturnsOnceThePeerAccepts) {
                  {"generic", "/dev/socket/tolk-service"},
                  {"radio", "/dev/hwbinder/radio.slot1"}};
     for (const auto &p : peers) {
-        int status = -1;
-        d.sim({"stop", p.peer}, &status);
-        ASSERT_EQ(0, status) << p.peer;
-        d.sim({"start", p.peer}, &status);
-        ASSERT_EQ(0, status) << p.peer;
+        ASSERT_EQ(0, runSim({"stop", "--root", d.root(), p.peer})) << p.peer;
+        ASSERT_EQ(0, runSim({"start", "--root", d.root(), p.peer})) << p.peer;
         int fd = sim::connectUnix(d.root() + p.socket);
         EXPECT_GE(fd, 0) << p.peer << ": connect right after start: " << strerror(errno);
         if (fd >= 0) close(fd);

@@ -33,9 +33,8 @@ public:
         : listenFd_(tolk_local_server(socketPath.c_str(), ANDROID_SOCKET_NAMESPACE_FILESYSTEM, SOCK_STREAM,
                                       kBacklog)) {}
     ~FakeRadioService() {
-        for (int fd : clients_) {
+        for (int fd : clients_)
             if (fd >= 0) close(fd);
-        }
         if (listenFd_ >= 0) close(listenFd_);
     }
 
