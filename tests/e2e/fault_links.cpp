@@ -26,13 +26,10 @@ TEST(FaultLinks, CableReplugsDuringTrafficThenUnplugged) {
     int fds = baselineFds(d);
 
     std::atomic<bool> stop(false);
-    std::atomic<int> answered(0);
     std::thread adbHost([&] {
-        while (!stop) {
-            std::string got = d.at("AT+CSDF?", true);
-            EXPECT_EQ(visible(kCsdfAnswer), visible(got)) << "the serial port's loss touches the adb link";
-            answered += got == kCsdfAnswer;
-        }
+        do {
+            EXPECT_EQ(visible(kCsdfAnswer), visible(d.at("AT+CSDF?", true))) << "adb during the replugs";
+        } while (!stop);
     });
     // A line typed before the daemon has reopened and set up the new port is
     // flushed with the port's stale input; wait for its settings to come back.
@@ -51,7 +48,6 @@ TEST(FaultLinks, CableReplugsDuringTrafficThenUnplugged) {
     }
     stop = true;
     adbHost.join();
-    EXPECT_GT(answered.load(), 0);
     expectServing(d, fds, "after the replugs");
 
     // Losing the cable for good ends the daemon with status 1, an open adb
@@ -75,16 +71,14 @@ TEST(FaultLinks, AdbConnectionsDroppedAndRacing) {
     SimDevice d;
     ASSERT_TRUE(d.started()) << d.upOutput();
     int fds = baselineFds(d);
+    // Nothing, half lines, a whole one; "AT+CSDF?\r" must not join the "AT+CSDF=1" before it.
+    const char *const says[] = {"", "AT+CSD", "AT+CSDF=1", "AT+CSDF?\r"};
     for (int i = 0; i < 200; i++) {
         int fd = d.connectAdb();
         ASSERT_GE(fd, 0) << "connection " << i;
-        if (i % 4 == 1) writeAll(fd, "AT+CSD");
-        if (i % 4 == 2) {
-            writeAll(fd, "AT+CSDF=1");  // then "AT+CSDF?\r" from the next one must not join it
-            usleep(1000);               // traffic shaping, not a wait: let the daemon read the half line
-        }
+        writeAll(fd, says[i % 4]);
+        usleep(1000);  // traffic shaping, not a wait: the daemon reads a half line before the hang-up
         if (i % 4 == 3) {
-            writeAll(fd, "AT+CSDF?\r");
             EXPECT_EQ(visible(kCsdfAnswer), visible(readUntil(fd, "OK\r\n", 3000))) << "connection " << i;
         }
         close(fd);

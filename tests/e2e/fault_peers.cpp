@@ -59,9 +59,9 @@ TEST(FaultPeers, RadioServiceFlappingUnderTraffic) {
     EXPECT_EQ(answered + 1 + 1, countOf(d.readFile("/journal/radio.slot1.log"), "-1\tAT+CSQ\\x00\n") - silent)
         << answered << " answered, " << silent << " silent";
 
-    d.at(std::vector<std::string>{"AT+MODEL", "MM+LOOP=1", "AT*CIT_KEY"}, true);
+    d.at(std::vector<std::string>{"AT+MODEL", "MM+LOOP=1", "AT*CIT_KEY"}, true);  // hang-ups
     const char *const held[][2] = {{"AT+POWERKEY", "generic"}, {"AUD+TXT", "audio"}, {"AT*CIT_GPS", "cit"}};
-    for (const auto &h : held) {
+    for (const auto &h : held) {  // the peer stopped while the daemon waits on it
         d.at(h[0], true);
         simOk(d, {"stop", h[1]});
         simOk(d, {"start", h[1]});

@@ -35,14 +35,6 @@ const struct {
     {"AT+CSDF=1,1", "\r\nOK\r\n", kLocal},
 };
 
-// A host link, closed at the end.
-struct Link {
-    int fd;
-    ~Link() {
-        if (fd >= 0) close(fd);
-    }
-};
-
 // Resident memory of the daemon in kB (VmRSS), once it has settled; -1 when unknown.
 long tolkdRssKb(const SimDevice &d) {
     usleep(100 * 1000);
@@ -55,20 +47,21 @@ long tolkdRssKb(const SimDevice &d) {
 TEST(Soak, MixedTrafficOnBothLinks) {
     SimDevice d({"--prop", "persist.service.tolk.usermode=1"});
     ASSERT_TRUE(d.started()) << d.upOutput();
-    Link serial{d.openSerial()}, adb{d.connectAdb()};
-    ASSERT_TRUE(serial.fd >= 0 && adb.fd >= 0);
-    writeAll(serial.fd, "ATE0\r");
-    ASSERT_EQ("ATE0\n\r\nOK\r\n", readUntil(serial.fd, "OK\r\n"));
+    // The host links, held to the end (a failed assertion leaves them to the
+    // process's exit).
+    int serial = d.openSerial(), adb = d.connectAdb();
+    ASSERT_TRUE(serial >= 0 && adb >= 0);
+    writeAll(serial, "ATE0\r");
+    ASSERT_EQ("ATE0\n\r\nOK\r\n", readUntil(serial, "OK\r\n"));
 
     const int errorsAtStart = countOf(d.log(), " E TOLKD");
     const char *env = getenv("TOLK_SOAK_COMMANDS");
     const long total = std::max(2000L, env && *env ? atol(env) : 100000L);
-    long sent[3] = {0, 0, 0}, rssAfterWarmup = -1;
-    int fdsAfterWarmup = -1;
+    long sent[3] = {0, 0, 0}, rssAfterWarmup = -1, fdsAfterWarmup = -1;
     auto start = std::chrono::steady_clock::now();
     for (long i = 0; i < total; i++) {
         const auto &c = kMix[i % std::size(kMix)];
-        int fd = i % 50 == 7 ? serial.fd : adb.fd;
+        int fd = i % 50 == 7 ? serial : adb;
         ASSERT_TRUE(writeAll(fd, std::string(c.line) + "\r"));
         ASSERT_EQ(visible(c.answer), visible(readUntil(fd, c.answer))) << "command " << i << " " << c.line;
         sent[c.target]++;
@@ -84,8 +77,9 @@ TEST(Soak, MixedTrafficOnBothLinks) {
         }
     }
     long rss = tolkdRssKb(d);
-    printf("soak: %ld commands in %.1f s, VmRSS %ld kB after 1000, %ld kB at the end\n", total,
-           std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count(), rssAfterWarmup, rss);
+    std::chrono::duration<double> took = std::chrono::steady_clock::now() - start;
+    printf("soak: %ld commands in %.1f s, VmRSS %ld kB after 1000, %ld kB at the end\n", total, took.count(),
+           rssAfterWarmup, rss);
     EXPECT_EQ(fdsAfterWarmup, d.tolkdFdCount());
     EXPECT_GT(rssAfterWarmup, 0);
     // Under a wrapper (valgrind) the process's memory is mostly the wrapper's own;
@@ -104,6 +98,8 @@ TEST(Soak, MixedTrafficOnBothLinks) {
     EXPECT_EQ(sent[kGeneric], countOf(generic, "\n"));
     EXPECT_EQ(sent[kGeneric], countOf(generic, "AT%OSVER\n"));
     EXPECT_EQ(errorsAtStart, countOf(d.log(), " E TOLKD")) << "no error was logged";
+    close(serial);
+    close(adb);
 }
 
 }  // namespace
