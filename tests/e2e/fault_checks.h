@@ -6,9 +6,6 @@
 
 #include <unistd.h>
 
-#include <string>
-#include <vector>
-
 #include <gtest/gtest.h>
 
 #include "sim_device.h"

@@ -3,12 +3,9 @@
 // what it must, and keeps serving (over-long lines, stray control bytes and a
 // half line left by a dropped connection: transcripts/link_faults.tx).
 #include <signal.h>
-#include <unistd.h>
 
 #include <atomic>
 #include <thread>
-
-#include <gtest/gtest.h>
 
 #include "../support/eventually.h"
 #include "fault_checks.h"

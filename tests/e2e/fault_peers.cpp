@@ -2,13 +2,10 @@
 // answer or a defined failure, the daemon keeps serving, keeps its descriptor
 // count, and every command reaches the peer exactly once. (Peers silent,
 // hanging up or stopped while the daemon waits: transcripts/peer_faults.tx.)
-#include <unistd.h>
 
 #include <atomic>
 #include <map>
 #include <thread>
-
-#include <gtest/gtest.h>
 
 #include "fault_checks.h"
 

@@ -1,8 +1,6 @@
 // Properties at their limits or holding nonsense where a number is read: every
 // command still gets a defined answer (the device root's files missing or
 // misshaped: transcripts/root_faults.tx).
-#include <gtest/gtest.h>
-
 #include "fault_checks.h"
 
 using namespace fault_checks;

@@ -56,10 +56,8 @@ protected:
         EXPECT_TRUE(std::regex_search(journal, sent)) << journal;
     }
 
-    static SimDevice *dev_;
+    inline static SimDevice *dev_ = nullptr;
 };
-
-SimDevice *HostClients::dev_ = nullptr;
 
 }  // namespace
 

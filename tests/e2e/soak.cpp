@@ -6,14 +6,10 @@
 // the sanitizer and valgrind runs use fewer). Roughly one in fifty goes to the
 // serial port, whose reads carry a fixed 10 ms pause each.
 #include <stdlib.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <chrono>
 #include <fstream>
-#include <iterator>
-
-#include <gtest/gtest.h>
 
 #include "fault_checks.h"
 
