@@ -219,44 +219,21 @@ bool writeAll(int fd, const std::string &data) {
     return true;
 }
 
-namespace {
-
-// Reads whatever arrives until stop() says enough, nothing arrives for quietMs
-// (quietMs < 0: no quiet rule) or totalMs has passed.
-template <typename Stop>
-std::string readLoop(int fd, int quietMs, int totalMs, Stop stop) {
+std::string readUntil(int fd, const std::string &needle, int timeoutMs) {
     std::string got;
-    long long deadline = sim::nowMs() + totalMs;
     char buf[8192];
-    for (;;) {
-        long long left = deadline - sim::nowMs();
-        if (left <= 0) break;
-        int wait = quietMs >= 0 && quietMs < left ? quietMs : static_cast<int>(left);
+    for (long long left, end = sim::nowMs() + timeoutMs; (left = end - sim::nowMs()) > 0;) {
         struct pollfd p = {fd, POLLIN, 0};
-        int r = poll(&p, 1, wait);
+        int r = poll(&p, 1, static_cast<int>(left));
         if (r < 0 && errno == EINTR) continue;
-        if (r <= 0) {
-            if (quietMs >= 0) break;
-            continue;
-        }
+        if (r == 0) break;
         ssize_t n = read(fd, buf, sizeof buf);
         if (n < 0 && (errno == EINTR || errno == EAGAIN)) continue;
         if (n <= 0) break;
         got.append(buf, static_cast<size_t>(n));
-        if (stop(got)) break;
+        if (got.find(needle) != std::string::npos) break;
     }
     return got;
-}
-
-}  // namespace
-
-std::string readQuiet(int fd, int quietMs, int totalMs) {
-    return readLoop(fd, quietMs, totalMs, [](const std::string &) { return false; });
-}
-
-std::string readUntil(int fd, const std::string &needle, int timeoutMs) {
-    return readLoop(fd, -1, timeoutMs,
-                    [&](const std::string &got) { return got.find(needle) != std::string::npos; });
 }
 
 std::string visible(const std::string &bytes) { return sim::visibleBytes(bytes); }

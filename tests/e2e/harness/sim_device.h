@@ -67,8 +67,6 @@ private:
 
 // Writes all of data to fd.
 bool writeAll(int fd, const std::string &data);
-// Reads from fd until nothing arrives for quietMs (or totalMs has passed).
-std::string readQuiet(int fd, int quietMs = 300, int totalMs = 5000);
 // Reads from fd until the bytes read contain needle (or timeoutMs has passed).
 std::string readUntil(int fd, const std::string &needle, int timeoutMs = 5000);
 // Byte-exact, readable rendering for assertion messages ("\r\n" shown as \r\n).
