@@ -1,6 +1,5 @@
 #include "sim_device.h"
 
-#include <dirent.h>
 #include <errno.h>
 #include <fcntl.h>
 #include <ftw.h>
@@ -18,6 +17,8 @@
 #include <algorithm>
 #include <cstdio>
 #include <cstring>
+#include <filesystem>
+#include <iterator>
 #include <sstream>
 
 #include <gtest/gtest.h>
@@ -85,18 +86,15 @@ SimDevice::~SimDevice() {
     runSim({"down", "--root", root_});
     // A sanitizer report from tolkd, a peer or the supervisor fails the test
     // that ran them, even when every answer was right.
-    if (DIR *d = opendir((root_ + "/log").c_str())) {
-        while (struct dirent *e = readdir(d)) {
-            if (e->d_name[0] == '.') continue;
-            std::string text = readFile(std::string("/log/") + e->d_name);
-            for (const char *mark : {"ERROR: AddressSanitizer", "ERROR: LeakSanitizer", "runtime error:"}) {
-                size_t pos = text.find(mark);
-                if (pos != std::string::npos)
-                    ADD_FAILURE() << "sanitizer report in log/" << e->d_name << ":\n"
-                                  << text.substr(pos > 200 ? pos - 200 : 0, 3000);
-            }
+    std::error_code ec;
+    for (const auto &entry : std::filesystem::directory_iterator(root_ + "/log", ec)) {
+        std::string text = sim::readFileOr(entry.path().string());
+        for (const char *mark : {"ERROR: AddressSanitizer", "ERROR: LeakSanitizer", "runtime error:"}) {
+            size_t pos = text.find(mark);
+            if (pos != std::string::npos)
+                ADD_FAILURE() << "sanitizer report in " << entry.path().string() << ":\n"
+                              << text.substr(pos > 200 ? pos - 200 : 0, 3000);
         }
-        closedir(d);
     }
     const ::testing::TestInfo *info = ::testing::UnitTest::GetInstance()->current_test_info();
     bool failed = info && info->result() && info->result()->Failed();
@@ -188,15 +186,9 @@ int SimDevice::tolkdExitStatus(int timeoutMs) const {
 }
 
 int SimDevice::tolkdFdCount() const {
-    pid_t pid = tolkdPid();
-    if (pid <= 0) return -1;
-    DIR *d = opendir(("/proc/" + std::to_string(pid) + "/fd").c_str());
-    if (!d) return -1;
-    int n = 0;
-    while (struct dirent *e = readdir(d))
-        if (e->d_name[0] != '.') n++;
-    closedir(d);
-    return n;
+    std::error_code ec;
+    std::filesystem::directory_iterator it("/proc/" + std::to_string(tolkdPid()) + "/fd", ec);
+    return ec || tolkdPid() <= 0 ? -1 : static_cast<int>(std::distance(it, std::filesystem::directory_iterator()));
 }
 
 int SimDevice::openSerial() const { return sim::openRawTty(sim::RootLayout{root_}.hostTty()); }
