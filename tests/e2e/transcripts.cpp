@@ -126,16 +126,13 @@ bool parseStmt(const std::string &line, Stmt *st) {
         st->a = bytesOf(p) + (st->nocr ? "" : "\r");
         return true;
     }
-    if (std::regex_match(line, m, journalRe)) {
-        st->verb = m[3] == "(end)" ? "journal-end" : m[2].matched ? "journal-later" : "journal";
-        st->a = m[1];
-        return decode(m[3], 2, &st->want);
-    }
     // The radio journal's lines are SERIAL<TAB>REQUEST[<TAB>refused: WHY]; tolkd sends serial -1.
-    if (std::regex_match(line, m, radioRe)) {
+    bool radio = std::regex_match(line, m, radioRe);
+    if (radio || std::regex_match(line, m, journalRe)) {
         st->verb = m[3] == "(end)" ? "journal-end" : m[2].matched ? "journal-later" : "journal";
-        st->a = "radio.slot" + m[1].str() + ".log";
-        std::string text = m[3] == "(end)" ? "(end)" : "-1\t" + m[3].str() + (m[4].matched ? "\t" + m[4].str() : "");
+        st->a = radio ? "radio.slot" + m[1].str() + ".log" : m[1].str();
+        std::string text = m[3];
+        if (radio && text != "(end)") text = "-1\t" + text + (m[4].matched ? "\t" + m[4].str() : "");
         return decode(text, 2, &st->want);
     }
     if (std::regex_match(line, m, propRe)) {
@@ -380,14 +377,11 @@ private:
     std::unique_ptr<Device> shared_;
 };
 
-class GroupTest : public ::testing::Test {
-public:
-    GroupTest(Runner *r, size_t gi) : r_(r), gi_(gi) {}
-    void TestBody() override { r_->runGroup(gi_); }
-
-private:
-    Runner *r_;
-    size_t gi_;
+struct GroupTest : ::testing::Test {
+    GroupTest(Runner *runner, size_t group) : runner(runner), group(group) {}
+    void TestBody() override { runner->runGroup(group); }
+    Runner *runner;
+    size_t group;
 };
 
 }  // namespace
