@@ -31,13 +31,12 @@ const struct {
     {"AT+CSDF=1,1", "\r\nOK\r\n", kLocal},
 };
 
-// Resident memory of the daemon in kB (VmRSS), once it has settled; -1 when unknown.
+// Resident memory of the daemon in kB, once it has settled; negative when unknown.
 long tolkdRssKb(const SimDevice &d) {
     usleep(100 * 1000);
-    std::ifstream in("/proc/" + std::to_string(d.tolkdPid()) + "/status");
-    for (std::string line; std::getline(in, line);)
-        if (line.compare(0, 6, "VmRSS:") == 0) return atol(line.c_str() + 6);
-    return -1;
+    long size = 0, pages = -1;
+    std::ifstream("/proc/" + std::to_string(d.tolkdPid()) + "/statm") >> size >> pages;
+    return pages * (sysconf(_SC_PAGESIZE) / 1024);
 }
 
 TEST(Soak, MixedTrafficOnBothLinks) {
@@ -74,7 +73,7 @@ TEST(Soak, MixedTrafficOnBothLinks) {
     }
     long rss = tolkdRssKb(d);
     std::chrono::duration<double> took = std::chrono::steady_clock::now() - start;
-    printf("soak: %ld commands in %.1f s, VmRSS %ld kB after 1000, %ld kB at the end\n", total, took.count(),
+    printf("soak: %ld commands in %.1f s, resident %ld kB after 1000, %ld kB at the end\n", total, took.count(),
            rssAfterWarmup, rss);
     EXPECT_EQ(fdsAfterWarmup, d.tolkdFdCount());
     EXPECT_GT(rssAfterWarmup, 0);

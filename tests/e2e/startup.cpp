@@ -2,7 +2,6 @@
 // engineering boot mode, and a simulator that leaves nothing running. The boot
 // modes that serve, ATM mode and the PCT switch are in transcripts/startup.tx.
 #include <signal.h>
-#include <unistd.h>
 
 #include <gtest/gtest.h>
 
@@ -31,7 +30,7 @@ TEST(Simulator, DownStopsEverythingAndIsIdempotent) {
     SimDevice d;
     ASSERT_TRUE(d.started()) << d.upOutput();
     pid_t tolkd = d.tolkdPid();
-    pid_t supervisor = static_cast<pid_t>(atol(d.env("TOLK_SIM_PID").c_str()));
+    pid_t supervisor = std::stoi(d.env("TOLK_SIM_PID"));
     ASSERT_TRUE(alive(tolkd) && alive(supervisor));
 
     std::string out;
