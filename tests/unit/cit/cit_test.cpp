@@ -12,7 +12,6 @@
 #include "cit/cit_cmd.h"
 #include "cit/pro_info.h"
 #include "host_capture.h"
-#include "test_root.h"
 
 namespace {
 
@@ -49,21 +48,18 @@ private:
     pid_t pid_;
 };
 
-class CitTest : public ::testing::Test {
+class CitTest : public LinkTest {
 protected:
-    void SetUp() override { sock_id = -1; }
     void TearDown() override {
-        if (sock_id >= 0) close(sock_id);
+        closeFd(sock_id);
+        LinkTest::TearDown();
     }
     // Runs a line; gives what the host received.
     std::string ask(const std::string &line, int result = 0) {
         std::string buf = line;
         EXPECT_EQ(result, cit_test_pase(&buf[0])) << line;
-        return host_.take();
+        return host.take();
     }
-
-    TestRoot root_;
-    HostCapture host_;
 };
 using CitLocal = CitTest;
 using CitForward = CitTest;
@@ -85,14 +81,14 @@ std::string framedVerdict(const std::string &text, bool ok) {
 // read without "=": cit.tx.)
 TEST_F(CitLocal, ProInfoRefusesIndexesOutsideTheRecord) {
     const std::string before(PRODUCT_INFO_SIZE, '\0');
-    root_.write(kStore, before);
+    root.write(kStore, before);
     for (const char *line : {"AT*CIT_READPROINFO=-1", "AT*CIT_READPROINFO=99999999999999999999",
                              "AT*CIT_WRITEPROINFO=-5,1", "AT*CIT_WRITEPROINFO=4294967296,1"}) {
         EXPECT_EQ("\r\nERROR\r\n", ask(line)) << line;
     }
     // Without both "=" and "," a write gets no answer at all.
     EXPECT_EQ("", ask("AT*CIT_WRITEPROINFO 5,6"));
-    EXPECT_EQ(before, root_.read(kStore));
+    EXPECT_EQ(before, root.read(kStore));
 }
 
 // The station records a pass for every OK: a flag that did not reach the store is
@@ -100,28 +96,28 @@ TEST_F(CitLocal, ProInfoRefusesIndexesOutsideTheRecord) {
 // and AT*CIT_WriteUserAT on a record of the wrong shape: cit.tx.)
 TEST_F(CitLocal, FlagWritesAnswerOkOnlyWhenStored) {
     EXPECT_EQ("\r\nERROR\r\n", ask("AT*CIT_WRITEUSERAT")) << "no store";
-    root_.write(kStore, std::string(PRODUCT_INFO_SIZE, '\x01'));
+    root.write(kStore, std::string(PRODUCT_INFO_SIZE, '\x01'));
     EXPECT_EQ("\r\nWriteUserAT Pass\r\nOK\r\n", ask("AT*CIT_WRITEUSERAT"));
     EXPECT_EQ(0, getFlag(FLAG_USER_AT));
 }
 
 // A file too short to hold character 7 is written whole, never padded with NULs:
-// root_faults.tx.
+// rootfaults.tx.
 TEST_F(CitLocal, ResultFileEdges) {
     EXPECT_EQ("\r\nERROR\r\n", ask("AT*CIT_WCITF")) << "no folder: neither opened nor created";
     // An existing file keeps its other characters; only character 7 changes.
-    root_.write(CIT_RESULT_FILE, "y1234560tail");
+    root.write(CIT_RESULT_FILE, "y1234560tail");
     ask("AT*CIT_WCITF");
-    EXPECT_EQ("y1234561tail", root_.read(CIT_RESULT_FILE));
+    EXPECT_EQ("y1234561tail", root.read(CIT_RESULT_FILE));
     // At most 32 characters of the first line are shown.
-    root_.write(CIT_RESULT_FILE, std::string(40, '7'));
+    root.write(CIT_RESULT_FILE, std::string(40, '7'));
     EXPECT_EQ("\r\n" + std::string(32, '7') + "\r\nOK\r\n", ask("AT*CIT_GACITF"));
 }
 
 // The answer buffer holds 1024 bytes: a long answer is cut so that its final
 // result and terminator always fit, and the host always gets a whole final line.
 TEST_F(CitForward, LongAnswersAreCutSoTheFinalResultFits) {
-    TestApp app(root_);
+    TestApp app(root);
     const struct {
         std::string answer, shown;
         bool ok;
@@ -133,7 +129,7 @@ TEST_F(CitForward, LongAnswersAreCutSoTheFinalResultFits) {
         {pattern("Fail ", 1024), pattern("Fail ", 1014), false},  // a full receive buffer
     };
     for (const auto &c : cases) {
-        root_.write("/app/sn", c.answer);
+        root.write("/app/sn", c.answer);
         EXPECT_EQ(framedVerdict(c.shown, c.ok), ask("AT*CIT_SN")) << c.answer.size() << " bytes answered";
     }
 }
@@ -142,12 +138,12 @@ TEST_F(CitForward, LongAnswersAreCutSoTheFinalResultFits) {
 // the application restarted, the command reaches the new one and is judged on its
 // answer, never on the empty answer of the dead link.
 TEST_F(CitForward, KeptLinkToARestartedApplicationIsNotReused) {
-    auto app = std::make_unique<TestApp>(root_);
+    auto app = std::make_unique<TestApp>(root);
     EXPECT_EQ("\r\ntest_fail_no_case\r\nERROR\r\n\r\n", ask("AT*CIT_NOSUCH", -1));
     ASSERT_GE(sock_id, 0) << "an unmatched line keeps the link";
     app.reset();  // the application restarts: its link ends, a new one serves
-    app = std::make_unique<TestApp>(root_);
-    root_.write("/app/sn", "SN0042");
+    app = std::make_unique<TestApp>(root);
+    root.write("/app/sn", "SN0042");
     EXPECT_EQ(framedVerdict("SN0042", true), ask("AT*CIT_SN"));
 }
 

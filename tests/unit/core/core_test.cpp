@@ -11,16 +11,13 @@
 
 #include <cutils/properties.h>
 
-#include "core/reader.h"
 #include "core/sms_merge.h"
 #include "host_capture.h"
-#include "targets/mmi_queue.h"
-#include "targets/target_conn.h"
 #include "test_root.h"
 
 namespace {
 
-class HostLinks : public ::testing::Test {
+class ReaderTest : public ::testing::Test {
 protected:
     TestRoot root;
     int master = -1;  // host side of the serial port
@@ -42,19 +39,14 @@ protected:
         tcsetattr(slave, TCSANOW, &t);
         gSerialDevice.fd[DEVICE_SERIAL] = slave;
 
-        int sp[2];
-        ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM, 0, sp));
-        gSerialDevice.fd[DEVICE_ADB] = sp[0];
-        adbHost = sp[1];
+        adbHost = socketLink(&gSerialDevice.fd[DEVICE_ADB]);
         listenAddr.sun_family = AF_UNIX;
         snprintf(listenAddr.sun_path, sizeof(listenAddr.sun_path), "%s/adb", root.path().c_str());
         int lfd = socket(AF_UNIX, SOCK_STREAM, 0);
         ASSERT_EQ(0, bind(lfd, (sockaddr *)&listenAddr, sizeof(listenAddr)));
         ASSERT_EQ(0, adb_socket_listen(lfd));
         gSerialDevice.fd[DEVICE_ADB_LISTEN] = lfd;
-        ASSERT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM, 0, sp));
-        s_fdRild_command = sp[0];
-        rildPeer = sp[1];
+        rildPeer = socketLink(&s_fdRild_command);
 
         isMsgCmdInput = isNeedMergeMsgCmdInput = false;
         msgCmdMode = 0;
@@ -63,14 +55,8 @@ protected:
     void TearDown() override {
         // The writers below, done or ended by their alarm.
         while (wait(nullptr) > 0) continue;
-        for (int &fd : gSerialDevice.fd) {
-            if (fd >= 0) close(fd);
-            fd = -1;
-        }
-        for (int fd : {master, adbHost, rildPeer, s_fdRild_command}) {
-            if (fd >= 0) close(fd);
-        }
-        s_fdRild_command = -1;
+        for (int &fd : gSerialDevice.fd) closeFd(fd);
+        for (int *fd : {&master, &adbHost, &rildPeer, &s_fdRild_command}) closeFd(*fd);
         isMsgCmdInput = isNeedMergeMsgCmdInput = false;
         alarm(0);
     }
@@ -93,7 +79,6 @@ protected:
         return raw ? std::string(line, gSerialDevice.cmdLen) : std::string(line);
     }
 };
-using ReaderTest = HostLinks;
 
 std::string mmitestLine(size_t len) {
     std::string f = "at^mmitest=";
@@ -177,7 +162,7 @@ TEST_F(ReaderTest, FailedAcceptKeepsTheLiveAdbConnection) {
 
 // Merged SMS text that would outgrow the buffer. (Merging itself, prompts, Ctrl-Z,
 // ESC and backspaces on both links: sms.tx.)
-using SmsMergeTest = HostLinks;
+using SmsMergeTest = ReaderTest;
 
 TEST_F(SmsMergeTest, MergedCommandNeverOutgrowsTheBuffer) {
     // Holds cmd in cmdBuf as routing leaves it and tries to start merging.
@@ -203,7 +188,7 @@ TEST_F(SmsMergeTest, MergedCommandNeverOutgrowsTheBuffer) {
 // The user-mode gate in front of the modem. No radio service runs under the test
 // root, so a line that reaches the modem is answered "ERROR:No Modem" by the
 // bridge: that is how this test sees it arrive.
-using UserModeGateTest = HostLinks;
+using UserModeGateTest = ReaderTest;
 
 TEST_F(UserModeGateTest, RefusedMmiCommandLeavesNoTextForTheNextCommand) {
     auto route = [&](const char *text) {

@@ -1,5 +1,5 @@
-// Test helpers: the in-memory state these tests change, back as in a freshly
-// started daemon, and a fixture that calls handlers the way the dispatcher does.
+// Test helpers: a fixture that calls handlers the way the dispatcher does, with
+// the in-memory state these tests change back as in a freshly started daemon.
 #ifndef TOLK_TESTS_DISPATCH_HANDLER_STATE_H
 #define TOLK_TESTS_DISPATCH_HANDLER_STATE_H
 
@@ -10,14 +10,6 @@
 #include "dispatch/dispatcher.h"
 #include "handlers/handlers.h"
 #include "host_capture.h"
-#include "targets/mmi_queue.h"
-#include "test_root.h"
-
-inline void resetHandlerState() {
-    gVzwTolkCfg = 0;
-    gCclkTz = 65535;
-    mmiCmdSeqReset();
-}
 
 inline std::string prop(const char *name, const char *def = "(unset)") {
     char value[PROPERTY_VALUE_MAX];
@@ -25,10 +17,13 @@ inline std::string prop(const char *name, const char *def = "(unset)") {
     return value;
 }
 
-class HandlerTest : public ::testing::Test {
+class HandlerTest : public LinkTest {
 protected:
-    void SetUp() override { resetHandlerState(); }
-    void TearDown() override { resetHandlerState(); }
+    void SetUp() override {
+        LinkTest::SetUp();
+        gVzwTolkCfg = 0;
+        gCclkTz = 65535;
+    }
 
     // A zeroed response buffer for every call, as the dispatcher gives.
     int call(CmdHandler h, const char *param, int op) {
@@ -36,8 +31,6 @@ protected:
         return h(param, op, response);
     }
 
-    TestRoot root;
-    HostCapture host;
     char response[RESPONSE_BUF_SIZE];
 };
 

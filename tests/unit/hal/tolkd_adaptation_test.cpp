@@ -1,16 +1,11 @@
 // The radio HAL bridge against an in-test radio service.
 #include <cutils/properties.h>
 
-#include "../../platform/hidl_fake_radio_service.h"
-#include "core/reader.h"
 #include "dispatch/dispatcher.h"
-#include "eventually.h"
+#include "fake_radio_service.h"
 #include "hal/tolkd_adaptation.h"
 #include "hal/tolkd_adaptation_impl.h"
 #include "host_capture.h"
-#include "targets/target_conn.h"
-#include "targets/target_relay.h"
-#include "test_root.h"
 
 namespace {
 
@@ -21,32 +16,24 @@ bool slotEmpty(int slot) {
     return empty;
 }
 
-void dropAllProxies() {
-    pthread_mutex_lock(&gTolkdAdaptation->mMutex);
-    for (auto &radio : gTolkdAdaptation->mRadio) radio.clear();
-    pthread_mutex_unlock(&gTolkdAdaptation->mMutex);
-}
-
 // A fresh device root, a host link to capture answers, and a bridge with no proxy
 // and a fresh modem pair.
-class HalBridge : public ::testing::Test {
+class HalBridge : public LinkTest {
 protected:
     void SetUp() override {
-        ASSERT_TRUE(host_.ok());
-        isATCmdInject = isMsgCmdInput = false;
-        s_fdRild_command = -1;
+        LinkTest::SetUp();
         connectTarget(RIL_TYPE);
         ASSERT_GE(s_fdRild_command, 0);
         ASSERT_NE(nullptr, gTolkdAdaptation);
-        dropAllProxies();
     }
     void TearDown() override {
         // Proxies point at this test's services; the next test starts without them.
-        dropAllProxies();
-        close(s_fdRild_command);
-        s_fdRild_command = -1;
+        pthread_mutex_lock(&gTolkdAdaptation->mMutex);
+        for (auto &radio : gTolkdAdaptation->mRadio) radio.clear();
+        pthread_mutex_unlock(&gTolkdAdaptation->mMutex);
+        LinkTest::TearDown();
     }
-    std::string slotPath(const char *instance) { return root_.at(std::string(RADIO_WIRE_PATH_PREFIX) + instance); }
+    std::string slotPath(const char *instance) { return root.at(std::string(RADIO_WIRE_PATH_PREFIX) + instance); }
     // A request went out and the service took it as frame n (counting from 1).
     void expectFrame(FakeRadioService &s, size_t n, uint32_t type, int connection, const std::string &payload) {
         ASSERT_TRUE(s.waitFrames(n));
@@ -55,9 +42,6 @@ protected:
         EXPECT_EQ(connection, f.connection) << "frame " << n;
         EXPECT_EQ(payload, f.payload) << "frame " << n;
     }
-
-    TestRoot root_;
-    HostCapture host_;
 };
 
 }  // namespace
@@ -84,7 +68,6 @@ TEST_F(HalBridge, SlotComesFromTheSimSelection) {
 
 TEST_F(HalBridge, CommandGoesToTheSelectedSlotWithItsNulAndAnswersComeBackThroughThePair) {
     FakeRadioService slot1(slotPath("slot1")), slot2(slotPath("slot2"));
-    ASSERT_TRUE(slot1.ok() && slot2.ok());
     ASSERT_EQ(0, property_set("persist.service.tolk.sim", "9"));
     ASSERT_EQ(0, property_set("persist.radio.cdma_slot", "2"));
 
@@ -96,8 +79,8 @@ TEST_F(HalBridge, CommandGoesToTheSelectedSlotWithItsNulAndAnswersComeBackThroug
     EXPECT_EQ(0, slot1.connections());
 
     // Answer and unsolicited output reach the main-loop end byte for byte, in order.
-    ASSERT_TRUE(slot2.respond("\r\n+CSQ: 20,99\r\n\r\nOK\r\n"));
-    ASSERT_TRUE(slot2.indicate(std::string("\r\n+CREG: 1\r\n\0", 13)));
+    ASSERT_TRUE(slot2.send(RADIO_WIRE_RESPONSE, "\r\n+CSQ: 20,99\r\n\r\nOK\r\n"));
+    ASSERT_TRUE(slot2.send(RADIO_WIRE_INDICATION, std::string("\r\n+CREG: 1\r\n\0", 13)));
     const std::string expected = "\r\n+CSQ: 20,99\r\n\r\nOK\r\n" + std::string("\r\n+CREG: 1\r\n\0", 13);
     std::string got;
     ASSERT_TRUE(eventually([&] { return (got += drainFd(s_fdRild_command, 20)).size() >= expected.size(); }));
@@ -111,7 +94,6 @@ TEST_F(HalBridge, CommandGoesToTheSelectedSlotWithItsNulAndAnswersComeBackThroug
 
 TEST_F(HalBridge, TransportFailureDropsTheProxyAndTheNextRequestSetsUpAgain) {
     FakeRadioService slot1(slotPath("slot1"));
-    ASSERT_TRUE(slot1.ok());
     ASSERT_TRUE(sendRequest("AT", 3));
     ASSERT_TRUE(slot1.waitFrames(2));
     // Without the death link only the failing request can find out.
@@ -127,7 +109,6 @@ TEST_F(HalBridge, TransportFailureDropsTheProxyAndTheNextRequestSetsUpAgain) {
 
 TEST_F(HalBridge, ServiceDeathDropsItsOwnProxyOnlyAndTheNextCommandRegistersAgain) {
     FakeRadioService slot1(slotPath("slot1")), slot3(slotPath("slot3"));
-    ASSERT_TRUE(slot1.ok() && slot3.ok());
     ASSERT_TRUE(sendRequest("AT", 3));
     ASSERT_EQ(0, property_set("persist.service.tolk.sim", "2"));
     ASSERT_TRUE(sendRequest("AT", 3));
@@ -153,7 +134,6 @@ TEST_F(HalBridge, ServiceDeathDropsItsOwnProxyOnlyAndTheNextCommandRegistersAgai
 
 TEST_F(HalBridge, NewModemPairReplacesAndClosesTheOldBridgeEnd) {
     FakeRadioService slot1(slotPath("slot1"));
-    ASSERT_TRUE(slot1.ok());
     ASSERT_TRUE(sendRequest("AT", 3));
     ASSERT_TRUE(slot1.waitFrames(2));
     int oldMainEnd = s_fdRild_command;
@@ -166,6 +146,6 @@ TEST_F(HalBridge, NewModemPairReplacesAndClosesTheOldBridgeEnd) {
     char c;
     EXPECT_EQ(0, recv(oldMainEnd, &c, 1, 0));
     close(oldMainEnd);
-    ASSERT_TRUE(slot1.respond("\r\nRING\r\n"));
+    ASSERT_TRUE(slot1.send(RADIO_WIRE_RESPONSE, "\r\nRING\r\n"));
     EXPECT_EQ("\r\nRING\r\n", drainFd(s_fdRild_command));
 }

@@ -6,11 +6,7 @@
 #include <signal.h>
 #include <termios.h>
 
-#include <vector>
-
 #include "host_capture.h"
-#include "serial/response_writer.h"
-#include "serial/serial_device.h"
 
 namespace {
 
@@ -32,11 +28,8 @@ protected:
         slavePath_ = ptsname(master_);
     }
     void TearDown() override {
-        for (int fd : gSerialDevice.fd) {
-            if (fd >= 0) close(fd);
-        }
-        for (int fd : owned_) close(fd);
-        close(master_);
+        for (int &fd : gSerialDevice.fd) closeFd(fd);
+        closeFd(master_);
         reset();
     }
     static void reset() {
@@ -50,19 +43,9 @@ protected:
         EXPECT_GE(fd, 0);
         return gSerialDevice.fd[DEVICE_SERIAL] = fd;
     }
-    // A socket pair as device's link and the current one; returns the host end.
-    int link(int device, int type = SOCK_STREAM) {
-        int sv[2];
-        EXPECT_EQ(0, socketpair(AF_UNIX, type, 0, sv));
-        gSerialDevice.fd[device] = sv[0];
-        gSerialDevice.currDevice = device;
-        owned_.push_back(sv[1]);
-        return sv[1];
-    }
 
     int master_ = -1;
     std::string slavePath_;
-    std::vector<int> owned_;
 };
 using SerialDeviceTest = SerialTest;
 using AudioWriterTest = SerialTest;
@@ -73,7 +56,11 @@ class ResponseWriterTest : public SerialTest {
 protected:
     void SetUp() override {
         SerialTest::SetUp();
-        host_ = link(DEVICE_SERIAL, SOCK_SEQPACKET);
+        host_ = socketLink(&gSerialDevice.fd[DEVICE_SERIAL], SOCK_SEQPACKET);
+    }
+    void TearDown() override {
+        closeFd(host_);
+        SerialTest::TearDown();
     }
     std::string hostGets(const char *data, int len) {
         writeDataToSerial(data, len);
@@ -176,8 +163,8 @@ TEST_F(AudioWriterTest, FatalErrorOnAdbDropsConnection) {
     struct sigaction ignore = {}, old = {};
     ignore.sa_handler = SIG_IGN;
     ASSERT_EQ(0, sigaction(SIGPIPE, &ignore, &old));
-    close(link(DEVICE_ADB));
-    owned_.pop_back();
+    close(socketLink(&gSerialDevice.fd[DEVICE_ADB]));
+    gSerialDevice.currDevice = DEVICE_ADB;
     const int fd = gSerialDevice.fd[DEVICE_ADB];
     writeDataToSerialByAudioType("AUD+X", 5);
     EXPECT_EQ(-1, gSerialDevice.fd[DEVICE_ADB]);

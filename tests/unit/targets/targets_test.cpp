@@ -4,60 +4,13 @@
 #include <fcntl.h>
 #include <sys/resource.h>
 
-#include <vector>
-
 #include <cutils/sockets.h>
 #include <tolk_platform/local_socket.h>
 
-#include "core/reader.h"
 #include "dispatch/dispatcher.h"
 #include "host_capture.h"
-#include "targets/mmi_queue.h"
-#include "targets/target_conn.h"
-#include "targets/target_relay.h"
-#include "test_root.h"
 
-namespace {
-
-void closeIfOpen(int &fd) {
-    if (fd >= 0) close(fd);
-    fd = -1;
-}
-
-// A fresh device root, a host link whose far end the test reads, and every link
-// and counter of the subsystem back at rest.
-class TargetLinks : public ::testing::Test {
-protected:
-    void SetUp() override {
-        ASSERT_TRUE(host_.ok());
-        isATCmdInject = isMsgCmdInput = false;
-        mmiCmdSeqReset();
-        s_fdRild_command = s_fdService_command = s_fdAudio_command = s_fdAudioExt_command = -1;
-    }
-    void TearDown() override {
-        for (int *fd : {&s_fdRild_command, &s_fdService_command, &s_fdAudio_command, &s_fdAudioExt_command}) {
-            closeIfOpen(*fd);
-        }
-        for (int &fd : extra_) closeIfOpen(fd);
-    }
-    // A connected pair: *global gets the daemon's end, the peer end is returned.
-    int link(int *global) {
-        int fds[2];
-        EXPECT_EQ(0, socketpair(AF_UNIX, SOCK_STREAM, 0, fds));
-        *global = fds[0];
-        extra_.push_back(fds[1]);
-        return fds[1];
-    }
-    // The peer of the newest link goes away.
-    void hangUp() { closeIfOpen(extra_.back()); }
-    std::string hostOutput(int waitMs = 300) { return host_.drain(waitMs); }
-
-    TestRoot root_;
-    HostCapture host_;
-    std::vector<int> extra_;
-};
-
-}  // namespace
+using TargetLinks = LinkTest;
 
 TEST_F(TargetLinks, AnswersAreRelayedAsReceivedAndFinalResultsEndSmsInput) {
     int peer = link(&s_fdService_command);
@@ -76,7 +29,7 @@ TEST_F(TargetLinks, AnswersAreRelayedAsReceivedAndFinalResultsEndSmsInput) {
         readDataFromTarget(GENERIC_TYPE, &s_fdService_command);
         EXPECT_EQ(!c.endsSmsInput, isMsgCmdInput) << c.answer;
         EXPECT_FALSE(isATCmdInject) << c.answer;
-        EXPECT_NE("", hostOutput(100)) << c.answer;
+        EXPECT_NE("", host.drain(100)) << c.answer;
     }
     EXPECT_FALSE(isFinalResult("\r\nOK", 3)) << "a final result lies within the bytes received";
     EXPECT_GE(s_fdService_command, 0);
@@ -86,23 +39,23 @@ TEST_F(TargetLinks, AnswersAreRelayedAsReceivedAndFinalResultsEndSmsInput) {
 TEST_F(TargetLinks, PeerShutdownReportsUeNotReadyOnceWhileAModemCommandIsOutstanding) {
     link(&s_fdService_command);
     isATCmdInject = true;
-    hangUp();
+    closeFd(peers.back());  // the peer goes away
     readDataFromTarget(GENERIC_TYPE, &s_fdService_command);
     EXPECT_EQ(-1, s_fdService_command);
     EXPECT_FALSE(isATCmdInject);
-    EXPECT_EQ("\r\nERROR:UE is not ready\r\n", hostOutput());
+    EXPECT_EQ("\r\nERROR:UE is not ready\r\n", host.drain());
 
     // A failed receive closes the link silently, whatever is outstanding.
     int pipeFds[2];
     ASSERT_EQ(0, pipe(pipeFds));
-    extra_.push_back(pipeFds[1]);
+    peers.push_back(pipeFds[1]);
     s_fdAudio_command = pipeFds[0];  // recv on a pipe fails with ENOTSOCK
     isATCmdInject = true;
     readDataFromTarget(AUDIO_TYPE, &s_fdAudio_command);
     EXPECT_EQ(-1, fcntl(pipeFds[0], F_GETFD));
     EXPECT_EQ(-1, s_fdAudio_command);
     EXPECT_TRUE(isATCmdInject);
-    EXPECT_EQ("", hostOutput(100));
+    EXPECT_EQ("", host.drain(100));
 }
 
 TEST_F(TargetLinks, ReadWithResultHonoursTheCallersSize) {
@@ -112,20 +65,20 @@ TEST_F(TargetLinks, ReadWithResultHonoursTheCallersSize) {
     memset(buf, 'x', sizeof(buf));
     readDataFromTargetWithResult(GENERIC_TYPE, &s_fdService_command, buf, sizeof(buf));
     EXPECT_STREQ("0123456", buf);
-    EXPECT_EQ("\r\n0123456\r\n", hostOutput());
+    EXPECT_EQ("\r\n0123456\r\n", host.drain());
     readDataFromTargetWithResult(GENERIC_TYPE, &s_fdService_command, two, sizeof(two));
     EXPECT_STREQ("7", two);
     readDataFromTargetWithResult(GENERIC_TYPE, &s_fdService_command, rest, sizeof(rest));
     EXPECT_STREQ("89", rest);
-    hostOutput(100);
+    host.drain(100);
 
     // Shutdown: the link is closed and the outstanding-command flag left alone.
     isATCmdInject = true;
-    hangUp();
+    closeFd(peers.back());  // the peer goes away
     readDataFromTargetWithResult(GENERIC_TYPE, &s_fdService_command, rest, sizeof(rest));
     EXPECT_EQ(-1, s_fdService_command);
     EXPECT_TRUE(isATCmdInject);
-    EXPECT_EQ("", hostOutput(100));
+    EXPECT_EQ("", host.drain(100));
 }
 
 TEST_F(TargetLinks, DescriptorsBeyondSelectsRangeCountAsFailedWaits) {
@@ -145,7 +98,7 @@ TEST_F(TargetLinks, DescriptorsBeyondSelectsRangeCountAsFailedWaits) {
     s_fdAudio_command = dup2(peer, FD_SETSIZE + 6);
     audioReaderLoop(AUDIO_TYPE);
     EXPECT_EQ(-1, s_fdAudio_command);
-    EXPECT_EQ("", hostOutput(100));
+    EXPECT_EQ("", host.drain(100));
 }
 
 TEST_F(TargetLinks, AudioExchangesStayOnTheirTypesAndRelayWholeAnswers) {
@@ -156,7 +109,7 @@ TEST_F(TargetLinks, AudioExchangesStayOnTheirTypesAndRelayWholeAnswers) {
     writeAll(audio, "pending");
     audioReaderLoop(GENERIC_TYPE);
     audioReaderLoop(RIL_TYPE);
-    EXPECT_EQ("", hostOutput(50));
+    EXPECT_EQ("", host.drain(50));
     drainFd(s_fdAudio_command, 50);
 
     // A device-maker answer longer than one read reaches the host whole, not just
@@ -164,7 +117,7 @@ TEST_F(TargetLinks, AudioExchangesStayOnTheirTypesAndRelayWholeAnswers) {
     std::string big(10000, '\x5a');
     writeAll(audio, big);
     audioReaderLoop(BELVO_AUDIO_TYPE);
-    EXPECT_EQ(big, hostOutput());
+    EXPECT_EQ(big, host.drain());
 
     // A missing link is reported and skipped.
     sendDataToAudio("x", 1, AUDIO_EXT_TYPE);
@@ -175,14 +128,14 @@ TEST_F(TargetLinks, AudioExchangesStayOnTheirTypesAndRelayWholeAnswers) {
 // Modem answers counted against the queue of customer MMI commands; the matched
 // answer goes, after its command's text, to the MMI client on the generic
 // service link, which is connected on demand.
-class MmiQueue : public TargetLinks {
+class MmiQueue : public LinkTest {
 protected:
     void SetUp() override {
-        TargetLinks::SetUp();
+        LinkTest::SetUp();
         modem_ = link(&s_fdRild_command);
         service_ = tolk_local_server(TOLK_SERVICE_SOCKET, ANDROID_SOCKET_NAMESPACE_RESERVED, SOCK_STREAM, 4);
         ASSERT_GE(service_, 0);
-        extra_.push_back(service_);
+        peers.push_back(service_);
     }
     void ordinaryCommand() { mmiCmdSeqEnQueue(); }
     // What the dispatcher does for a customer MMI command, then the routing's enqueue.
@@ -200,7 +153,7 @@ protected:
     // What the MMI client received on the generic service link so far.
     std::string mmiClient() {
         if (client_ < 0 && s_fdService_command >= 0) {
-            extra_.push_back(client_ = accept(service_, nullptr, nullptr));
+            peers.push_back(client_ = accept(service_, nullptr, nullptr));
         }
         return client_ < 0 ? std::string() : drainFd(client_, 200);
     }

@@ -1,12 +1,13 @@
-// An in-test radio service: listens on the socket of one instance under the
+// The radio HAL bridge tests' radio service: listens on the socket of one instance under the
 // current device root, records the frames its clients send and lets the test
 // answer, indicate or cut the connections. It has no thread of its own: every
 // call first takes in the connections and frames that have arrived, so only the
 // test's thread ever touches it.
-#ifndef TOLK_TESTS_HIDL_FAKE_RADIO_SERVICE_H
-#define TOLK_TESTS_HIDL_FAKE_RADIO_SERVICE_H
+#ifndef TOLK_TESTS_HAL_FAKE_RADIO_SERVICE_H
+#define TOLK_TESTS_HAL_FAKE_RADIO_SERVICE_H
 
 #include <cutils/sockets.h>
+#include <gtest/gtest.h>
 #include <poll.h>
 #include <sys/socket.h>
 #include <unistd.h>
@@ -31,14 +32,15 @@ public:
     // socketPath: host path of the instance's socket (TestRoot::at of the device path).
     explicit FakeRadioService(const std::string &socketPath)
         : listenFd_(tolk_local_server(socketPath.c_str(), ANDROID_SOCKET_NAMESPACE_FILESYSTEM, SOCK_STREAM,
-                                      kBacklog)) {}
+                                      kBacklog)) {
+        EXPECT_GE(listenFd_, 0) << socketPath;
+    }
     ~FakeRadioService() {
         for (int fd : clients_)
             if (fd >= 0) close(fd);
         if (listenFd_ >= 0) close(listenFd_);
     }
 
-    bool ok() const { return listenFd_ >= 0; }
     // Ends every client connection, as a dying service would.
     void dropConnections() {
         takeArrivals();
@@ -54,8 +56,6 @@ public:
         uint32_t length = static_cast<uint32_t>(payload.size());
         return radio_wire_send(clients_.back(), type, -1, 0, payload.data(), length) == 0;
     }
-    bool respond(const std::string &payload) { return send(RADIO_WIRE_RESPONSE, payload); }
-    bool indicate(const std::string &payload) { return send(RADIO_WIRE_INDICATION, payload); }
 
 private:
     // Accepts waiting clients and reads their frames, until nothing more is there.
