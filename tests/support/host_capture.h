@@ -56,7 +56,8 @@ inline int socketLink(int *daemonEnd, int type = SOCK_STREAM) {
 class HostCapture {
 public:
     // Text answers start in verbose mode, as after the daemon's start.
-    HostCapture() : peer_(socketLink(&gSerialDevice.fd[DEVICE_SERIAL])), mine_(gSerialDevice.fd[DEVICE_SERIAL]) {
+    HostCapture()
+        : peer_(socketLink(&gSerialDevice.fd[DEVICE_SERIAL])), mine_(gSerialDevice.fd[DEVICE_SERIAL]) {
         gSerialDevice.currDevice = DEVICE_SERIAL;
         gNumericMode = false;
     }
