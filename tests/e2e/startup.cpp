@@ -38,14 +38,11 @@ TEST(Simulator, DownStopsEverythingAndIsIdempotent) {
     EXPECT_NE(std::string::npos, out.find("already up")) << out;
     EXPECT_EQ(tolkd, d.tolkdPid());
 
-    int status = -1;
-    EXPECT_EQ("", d.sim({"down"}, &status));
+    EXPECT_EQ("", d.sim({"down"}));
     // A zombie of tolkd is reaped by the supervisor before it exits.
     EXPECT_TRUE(eventually([&] { return !alive(tolkd) && !alive(supervisor); }, 5000));
-    d.sim({"down"}, &status);
-    EXPECT_EQ(0, status);
-    d.sim({"replug"}, &status);
-    EXPECT_NE(0, status) << "no device is up any more";
+    EXPECT_EQ(0, runSim({"down", "--root", d.root()}));
+    EXPECT_NE(0, runSim({"replug", "--root", d.root()})) << "no device is up any more";
 }
 
 }  // namespace

@@ -35,9 +35,11 @@ using namespace vendor::orvane::hardware::radio::V2_0;
 namespace {
 
 // The radio service in a child process, stopped with SIGTERM like tolk-sim does.
-class Peer {
-public:
-    Peer() : pid_(fork()) {
+struct Peer {
+    TestRoot root_;  // removed with the peer; declared first, made before the fork
+    pid_t pid_ = fork();
+
+    Peer() {
         if (pid_ == 0) _exit(run_radio_peer(root_.path(), {}));
     }
     ~Peer() {
@@ -50,10 +52,6 @@ public:
         pid_ = -1;
         return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
     }
-    TestRoot root_;  // removed with the peer; declared first, made before the fork
-
-private:
-    pid_t pid_;
 };
 
 // Sends a frame with exactly these bytes and serial.
