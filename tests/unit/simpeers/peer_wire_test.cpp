@@ -54,19 +54,6 @@ struct Peer {
     }
 };
 
-// Sends a frame with exactly these bytes and serial.
-void sendFrame(int fd, uint32_t type, int32_t serial = -1, const std::string &payload = "") {
-    ASSERT_EQ(radio_wire_send(fd, type, serial, 0, payload.data(), static_cast<uint32_t>(payload.size())), 0);
-}
-
-// The payload of the next frame; "<none>" when nothing comes within ms.
-std::string recvFrame(int fd, RadioWireHeader *h, int ms = 2000) {
-    struct pollfd p = {fd, POLLIN, 0};
-    char buf[4096];
-    if (poll(&p, 1, ms) <= 0 || radio_wire_recv(fd, h, buf, sizeof buf) != 0) return "<none>";
-    return std::string(buf, h->length);
-}
-
 // Every callback of a proxy ("R:", "I:", "D:" and its text) with the thread it ran on.
 struct Recorder : ITolkResponse, ITolkIndication, hidl_death_recipient {
     std::mutex mutex;
@@ -101,16 +88,20 @@ TEST(RadioPeer, SilentBeforeRegisterThenRefusesWithTheRequestsSerial) {
     const std::string socket = peer.root_.at("/dev/hwbinder/radio.slot1");
     int fd = -1;
     ASSERT_TRUE(eventually([&] { return (fd = connectUnix(socket)) >= 0; }));
-    RadioWireHeader h;
-    sendFrame(fd, RADIO_WIRE_REQUEST, -1, std::string("AT+CGSN", sizeof "AT+CGSN"));
-    EXPECT_EQ(recvFrame(fd, &h, 300), "<none>");
-    sendFrame(fd, RADIO_WIRE_REGISTER);
+    struct pollfd p = {fd, POLLIN, 0};
+    ASSERT_EQ(0, radio_wire_send(fd, RADIO_WIRE_REQUEST, -1, 0, "AT+CGSN", sizeof "AT+CGSN"));
+    EXPECT_EQ(0, poll(&p, 1, 300)) << "an answer before REGISTER";
+    ASSERT_EQ(0, radio_wire_send(fd, RADIO_WIRE_REGISTER, 0, 0, nullptr, 0));
     // A request that is no line plus its NUL is answered like a line the modem
     // cannot take, with the request's own serial.
-    sendFrame(fd, RADIO_WIRE_REQUEST, 7, "AT+CSQ");
-    EXPECT_EQ(recvFrame(fd, &h), "\r\nERROR\r\n");
-    EXPECT_EQ(h.type, static_cast<uint32_t>(RADIO_WIRE_RESPONSE));
-    EXPECT_EQ(h.serial, 7);
+    ASSERT_EQ(0, radio_wire_send(fd, RADIO_WIRE_REQUEST, 7, 0, "AT+CSQ", 6));
+    RadioWireHeader h = {};
+    char answer[64];
+    ASSERT_EQ(1, poll(&p, 1, 2000));
+    ASSERT_EQ(0, radio_wire_recv(fd, &h, answer, sizeof answer));
+    EXPECT_EQ("\r\nERROR\r\n", std::string(answer, h.length));
+    EXPECT_EQ(static_cast<uint32_t>(RADIO_WIRE_RESPONSE), h.type);
+    EXPECT_EQ(7, h.serial);
     EXPECT_EQ(peer.root_.read("/journal/radio.slot1.log"),
               "-1\tAT+CGSN\\x00\n7\tAT+CSQ\trefused: no NUL at the end\n");
     close(fd);
