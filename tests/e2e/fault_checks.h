@@ -10,8 +10,6 @@
 
 #include "sim_device.h"
 
-namespace fault_checks {
-
 // What a local query answers on a link whose echo is off (adb always).
 const char kCsdfAnswer[] = "\r\n+CSDF: 1,1\n\r\n\r\nOK\r\n";
 
@@ -59,7 +57,5 @@ inline void expectServing(SimDevice &d, int fdsBefore, const char *when) {
     EXPECT_EQ(visible(kCsdfAnswer), visible(d.at("AT+CSDF?", true)));
     EXPECT_EQ(fdsBefore, settledFds(d, fdsBefore)) << "descriptors leaked or lost";
 }
-
-}  // namespace fault_checks
 
 #endif

@@ -10,10 +10,6 @@
 #include "../support/eventually.h"
 #include "fault_checks.h"
 
-using namespace fault_checks;
-
-namespace {
-
 // Each replug reopens the port (the old one closed: expectServing counts the
 // descriptors), keeps the echo setting, and never disturbs the adb link; an
 // unplug ends the daemon.
@@ -100,5 +96,3 @@ TEST(FaultLinks, AdbConnectionsDroppedAndRacing) {
     EXPECT_GT(complete.load(), 0);
     expectServing(d, fds, "after the connections");
 }
-
-}  // namespace

@@ -9,10 +9,6 @@
 
 #include "fault_checks.h"
 
-using namespace fault_checks;
-
-namespace {
-
 const std::string kCsq = "\r\n+CSQ: 20,99\r\n\r\nOK\r\n";
 const std::string kNoModem = "\r\nERROR:No Modem\r\n";
 const std::string kOk = "\r\nOK\r\n";
@@ -90,5 +86,3 @@ TEST(FaultPeersAudio, OverlongAnswerDoesNotShiftLaterAnswers) {
     EXPECT_EQ("\r\nV", d.at("AUD+VOL", true).substr(0, 3));
     EXPECT_EQ(visible(kOk + kOk), visible(d.at(std::vector<std::string>{"AUD+BIN", "MM+LOOP=1"}, true)));
 }
-
-}  // namespace

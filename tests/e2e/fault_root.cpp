@@ -3,10 +3,6 @@
 // misshaped: transcripts/root_faults.tx).
 #include "fault_checks.h"
 
-using namespace fault_checks;
-
-namespace {
-
 TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
     SimDevice d({"--prop", "persist.service.tolk.usermode=1"});
     ASSERT_TRUE(d.started()) << d.upOutput();
@@ -14,10 +10,7 @@ TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
 
     // The SIM choice names a slot; anything else finds no modem, never a wrong slot
     // (4 and -1 against their answers: modem.tx).
-    struct SlotCase {
-        const char *sim, *cdma;
-        std::string answer;
-    } slots[] = {
+    const std::string slots[][3] = {  // SIM choice, CDMA slot, answer
         {"abc", "1", "\r\n350000000000001\r\n\r\nOK\r\n"},  // no number reads as 0: slot 1
         {"3", "1", "\r\n350000000000004\r\n\r\nOK\r\n"},
         {"9", "2", "\r\n350000000000002\r\n\r\nOK\r\n"},
@@ -27,17 +20,17 @@ TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
         {"9", "5", noModem},
         {"9", "-2147483648", noModem},  // one below would overflow
         {"9", "2147483647", noModem},
-        {v91.c_str(), "1", noModem},
+        {v91, "1", noModem},
     };
     // Twice: each slot's service link, once made, is kept; the second pass must
     // not add any.
     int fds = -1;
     for (int pass = 0; pass < 2; pass++) {
-        for (const SlotCase &c : slots) {
-            SCOPED_TRACE(std::string("sim ") + c.sim + " cdma " + c.cdma);
-            d.setprop("persist.service.tolk.sim", c.sim);
-            d.setprop("persist.radio.cdma_slot", c.cdma);
-            EXPECT_EQ(visible(c.answer), visible(d.at("AT+CGSN", true)));
+        for (const auto &c : slots) {
+            SCOPED_TRACE("sim " + c[0] + " cdma " + c[1]);
+            d.setprop("persist.service.tolk.sim", c[0]);
+            d.setprop("persist.radio.cdma_slot", c[1]);
+            EXPECT_EQ(visible(c[2]), visible(d.at("AT+CGSN", true)));
         }
         if (pass == 0) fds = settledFds(d);
     }
@@ -55,5 +48,3 @@ TEST(FaultRoot, PropertiesAtTheirLimitsAndNonNumeric) {
               d.at(std::vector<std::string>{"AT@USBCONFIG?", "AT+CSDF?"}, true));
     EXPECT_EQ(fds, settledFds(d, fds));
 }
-
-}  // namespace

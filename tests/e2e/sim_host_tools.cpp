@@ -19,9 +19,7 @@
 #include "../support/eventually.h"
 #include "sim_device.h"
 
-namespace {
-
-int tcpConnect(int port) {
+static int tcpConnect(int port) {
     int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
     struct sockaddr_in a = {};
     a.sin_family = AF_INET;
@@ -33,20 +31,18 @@ int tcpConnect(int port) {
 }
 
 // True when the peer closes fd within ms, with nothing more to read before.
-bool closedWithin(int fd, int ms) {
+static bool closedWithin(int fd, int ms) {
     struct pollfd p = {fd, POLLIN, 0};
     char c;
     return poll(&p, 1, ms) == 1 && read(fd, &c, 1) == 0;
 }
 
 // Gone, or a zombie that its new parent has not reaped yet.
-bool ended(pid_t pid) {
+static bool ended(pid_t pid) {
     std::string stat = sim::readFileOr("/proc/" + std::to_string(pid) + "/stat");
     size_t paren = stat.rfind(')');
     return stat.empty() || (paren != std::string::npos && stat.compare(paren + 1, 3, " Z ") == 0);
 }
-
-}  // namespace
 
 // The interposer `tolk-sim host` preloads, called as a host program calls ioctl:
 // DTR and RTS as last set, by any descriptor or program; DSR, CTS and CD follow

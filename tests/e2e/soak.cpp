@@ -13,10 +13,6 @@
 
 #include "fault_checks.h"
 
-using namespace fault_checks;
-
-namespace {
-
 enum Target { kLocal, kModem, kGeneric };
 const struct {
     const char *line, *answer;
@@ -32,7 +28,7 @@ const struct {
 };
 
 // Resident memory of the daemon in kB, once it has settled; negative when unknown.
-long tolkdRssKb(const SimDevice &d) {
+static long tolkdRssKb(const SimDevice &d) {
     usleep(100 * 1000);
     long size = 0, pages = -1;
     std::ifstream("/proc/" + std::to_string(d.tolkdPid()) + "/statm") >> size >> pages;
@@ -73,7 +69,7 @@ TEST(Soak, MixedTrafficOnBothLinks) {
     }
     long rss = tolkdRssKb(d);
     std::chrono::duration<double> took = std::chrono::steady_clock::now() - start;
-    printf("soak: %ld commands in %.1f s, resident %ld kB after 1000, %ld kB at the end\n", total, took.count(),
+    printf("soak: %ld commands in %.1f s, RSS %ld kB after 1000, %ld kB at the end\n", total, took.count(),
            rssAfterWarmup, rss);
     EXPECT_EQ(fdsAfterWarmup, d.tolkdFdCount());
     EXPECT_GT(rssAfterWarmup, 0);
@@ -96,5 +92,3 @@ TEST(Soak, MixedTrafficOnBothLinks) {
     close(serial);
     close(adb);
 }
-
-}  // namespace

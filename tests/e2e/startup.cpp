@@ -8,8 +8,6 @@
 #include "../support/eventually.h"
 #include "sim_device.h"
 
-namespace {
-
 TEST(Startup, EngineeringBootModeStopsTheDaemonWithStatusZero) {
     for (const char *mode : {"5", "57"}) {
         SCOPED_TRACE(std::string("boot mode file \"") + mode + "\"");
@@ -23,7 +21,7 @@ TEST(Startup, EngineeringBootModeStopsTheDaemonWithStatusZero) {
     }
 }
 
-bool alive(pid_t pid) { return pid > 0 && kill(pid, 0) == 0; }
+static bool alive(pid_t pid) { return pid > 0 && kill(pid, 0) == 0; }
 
 // One device per root, and down leaves nothing running.
 TEST(Simulator, DownStopsEverythingAndIsIdempotent) {
@@ -44,5 +42,3 @@ TEST(Simulator, DownStopsEverythingAndIsIdempotent) {
     EXPECT_EQ(0, runSim({"down", "--root", d.root()}));
     EXPECT_NE(0, runSim({"replug", "--root", d.root()})) << "no device is up any more";
 }
-
-}  // namespace
