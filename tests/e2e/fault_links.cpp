@@ -31,9 +31,8 @@ TEST(FaultLinks, CableReplugsDuringTrafficThenUnplugged) {
     for (int i = 1; i <= kReplugs; i++) {
         simOk(d, {"replug"});
         EXPECT_TRUE(eventually([&] { return d.sim({"tty-settings"}) == settings; }, 5000));
-        std::string got = d.at("AT+CSDF?");
-        EXPECT_EQ(visible(i < kReplugs ? "AT+CSDF?\n" + std::string(kCsdfAnswer) : kCsdfAnswer), visible(got))
-            << "after replug " << i;
+        std::string want = i < kReplugs ? "AT+CSDF?\n" + std::string(kCsdfAnswer) : kCsdfAnswer;
+        EXPECT_EQ(visible(want), visible(d.at("AT+CSDF?"))) << "after replug " << i;
         if (i == kReplugs - 1) {
             EXPECT_EQ("ATE0\n\r\nOK\r\n", d.at("ATE0")) << "echo off before the last one";
             settings = d.sim({"tty-settings"});

@@ -21,10 +21,7 @@
 
 static int tcpConnect(int port) {
     int fd = socket(AF_INET, SOCK_STREAM | SOCK_CLOEXEC, 0);
-    struct sockaddr_in a = {};
-    a.sin_family = AF_INET;
-    a.sin_port = htons(static_cast<uint16_t>(port));
-    a.sin_addr.s_addr = htonl(INADDR_LOOPBACK);
+    struct sockaddr_in a = {AF_INET, htons(static_cast<uint16_t>(port)), {htonl(INADDR_LOOPBACK)}, {}};
     if (fd >= 0 && connect(fd, reinterpret_cast<struct sockaddr *>(&a), sizeof a) == 0) return fd;
     if (fd >= 0) close(fd);
     return -1;
@@ -121,16 +118,14 @@ TEST(SimHostTools, ForwarderRelaysTheAdbLinkOverLoopbackTcp) {
     ASSERT_EQ(2, sscanf(out.c_str(), "%d\n%d\n", &port, &pid)) << "the port picked, then the pid: " << out;
 
     const std::string direct = d.at("AT*CIT_GACITF", true);
-    int first = tcpConnect(port);
-    ASSERT_GE(first, 0);
-    ASSERT_TRUE(writeAll(first, "AT*CIT_GACITF\r"));
-    EXPECT_EQ(visible(direct), visible(readUntil(first, "OK\r\n")));
     // A second connection is a second adb connection: the daemon serves it and
     // drops the first, whose end reaches the TCP client.
-    int second = tcpConnect(port);
-    ASSERT_GE(second, 0);
-    ASSERT_TRUE(writeAll(second, "AT*CIT_GACITF\r"));
-    EXPECT_EQ(visible(direct), visible(readUntil(second, "OK\r\n")));
+    int first = -1, second = -1;
+    for (int *fd : {&first, &second}) {
+        ASSERT_GE(*fd = tcpConnect(port), 0);
+        ASSERT_TRUE(writeAll(*fd, "AT*CIT_GACITF\r"));
+        EXPECT_EQ(visible(direct), visible(readUntil(*fd, "OK\r\n")));
+    }
     EXPECT_TRUE(closedWithin(first, 3000)) << "the replaced connection is closed";
     // The client's half-close reaches the daemon, which closes its end.
     shutdown(second, SHUT_WR);
