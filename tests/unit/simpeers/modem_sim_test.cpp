@@ -9,14 +9,10 @@
 
 using namespace tolksim;
 
-namespace {
-
-std::string ok(const std::string &info = "") { return info + "\r\nOK\r\n"; }
-std::string line(const std::string &text) { return "\r\n" + text + "\r\n"; }
+static std::string ok(const std::string &info = "") { return info + "\r\nOK\r\n"; }
+static std::string line(const std::string &text) { return "\r\n" + text + "\r\n"; }
 const char kPrompt[] = "\r\n> ";
 const std::string kNul(1, '\0');
-
-}  // namespace
 
 // Each request in turn on one modem, with the answer it gets or the reason the
 // radio HAL's request format refuses it (refused requests are given with their
