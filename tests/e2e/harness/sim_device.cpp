@@ -23,6 +23,7 @@
 
 #include <gtest/gtest.h>
 
+#include "../../support/eventually.h"
 #include "sim_text.h"
 #include "sim_util.h"
 
@@ -112,22 +113,16 @@ SimDevice::~SimDevice() {
 }
 
 std::string SimDevice::at(const std::vector<std::string> &lines, bool adb, int quietMs) {
-    std::vector<std::string> args = {"at", "--root", root_, "--quiet-ms", std::to_string(quietMs),
-                                     "--timeout", "30"};
+    std::vector<std::string> args = {"at", "--quiet-ms", std::to_string(quietMs), "--timeout", "30"};
     if (adb) args.push_back("--adb");
     args.push_back("--");
     args.insert(args.end(), lines.begin(), lines.end());
-    std::string out;
-    runSim(args, &out);
-    return out;
+    return sim(args);
 }
 
 std::string SimDevice::sim(const std::vector<std::string> &args, int *status) {
-    std::vector<std::string> full;
-    if (!args.empty()) full.push_back(args[0]);
-    full.push_back("--root");
-    full.push_back(root_);
-    full.insert(full.end(), args.begin() + (args.empty() ? 0 : 1), args.end());
+    std::vector<std::string> full(args);
+    full.insert(full.begin() + (args.empty() ? 0 : 1), {"--root", root_});
     std::string out;
     int rc = runSim(full, &out);
     if (status) *status = rc;
@@ -173,16 +168,9 @@ std::string SimDevice::env(const std::string &key) const {
 pid_t SimDevice::tolkdPid() const { return static_cast<pid_t>(atol(env("TOLKD_PID").c_str())); }
 
 int SimDevice::tolkdExitStatus(int timeoutMs) const {
-    long long deadline = sim::nowMs() + timeoutMs;
-    for (;;) {
-        std::string s = readFile("/run/tolkd.status");
-        if (!s.empty()) {
-            if (s.compare(0, 7, "signal ") == 0) return 128 + atoi(s.c_str() + 7);
-            return atoi(s.c_str());
-        }
-        if (sim::nowMs() >= deadline) return -1;
-        sim::sleepMs(10);
-    }
+    std::string s;
+    if (!eventually([&] { return !(s = readFile("/run/tolkd.status")).empty(); }, timeoutMs)) return -1;
+    return s.compare(0, 7, "signal ") == 0 ? 128 + atoi(s.c_str() + 7) : atoi(s.c_str());
 }
 
 int SimDevice::tolkdFdCount() const {
