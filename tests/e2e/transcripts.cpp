@@ -6,6 +6,7 @@
 #include <poll.h>
 #include <unistd.h>
 
+#include <filesystem>
 #include <fstream>
 #include <map>
 #include <memory>
@@ -13,6 +14,7 @@
 
 #include <gtest/gtest.h>
 
+#include "../support/eventually.h"
 #include "sim_device.h"
 #include "sim_text.h"
 #include "sim_util.h"
@@ -154,8 +156,7 @@ bool parseStmt(const std::string &line, Stmt *st) {
 bool parse(const std::string &path, Transcript *t, std::string *err) {
     std::ifstream in(path);
     t->path = path;
-    t->name = path.substr(path.rfind('/') + 1);
-    t->name = t->name.substr(0, t->name.find('.'));
+    t->name = std::filesystem::path(path).stem().string();
     std::string raw;
     for (int n = 1; std::getline(in, raw); n++) {
         Group &g = t->groups.empty() ? t->setup : t->groups.back();
@@ -190,14 +191,6 @@ std::string takeNow(int fd) {
     char buf[4096];
     for (ssize_t n; (n = read(fd, buf, sizeof buf)) > 0;) got.append(buf, static_cast<size_t>(n));
     return got;
-}
-
-// Waits until done() holds (checked every 5 ms) or ms have passed.
-template <typename F>
-bool waitFor(int ms, F done) {
-    for (long long end = sim::nowMs() + ms; !done(); sim::sleepMs(5))
-        if (sim::nowMs() >= end) return false;
-    return true;
 }
 
 // One simulated device and its host links, kept across cases.
@@ -295,7 +288,7 @@ private:
             // the answer (feedback to the framework) may still be on its way.
             size_t &off = dev.journalOffset[st.a];
             bool found = false, taken = false;
-            waitFor(st.verb == "journal-end" ? 0 : kTimeoutMs, [&] {
+            eventually([&] {
                 std::string text = d.readFile("/journal/" + st.a);
                 for (size_t nl; !found && off <= text.size() && (nl = text.find('\n', off)) != std::string::npos;) {
                     got = text.substr(off, nl - off), off = nl + 1, taken = true;
@@ -303,24 +296,25 @@ private:
                     if (st.verb != "journal-later") break;
                 }
                 return found || (taken && st.verb == "journal");
-            });
+            }, st.verb == "journal-end" ? 0 : kTimeoutMs);
             if (st.verb == "journal-end" ? !got.empty() : !found)
                 fail(st.line, st.text + "\n  got: " + (got.empty() ? "(no new line)" : got));
         } else if (st.verb == "prop" || st.verb == "tty") {
             auto value = [&] {
                 if (st.verb == "prop") return d.getprop(st.a);
-                std::string all = "\n" + d.sim({"tty-settings"});
-                size_t at = all.find("\n" + st.a + "=");
-                return at == std::string::npos ? "(none)" : all.substr(at + st.a.size() + 2, all.find('\n', at + 1) - at - st.a.size() - 2);
+                std::string all = "\n" + d.sim({"tty-settings"}), key = "\n" + st.a + "=";
+                size_t at = all.find(key), from = at + key.size();
+                return at == std::string::npos ? "(none)" : all.substr(from, all.find('\n', from) - from);
             };
-            if (!waitFor(kTimeoutMs, [&] { return compare(st.want, got = value()) == 1; }))
+            if (!eventually([&] { return compare(st.want, got = value()) == 1; }, kTimeoutMs))
                 fail(st.line, st.text + "\n  got: " + sim::visibleBytes(got));
         } else if (st.verb == "file" || st.verb == "file-absent") {
             bool absent = st.verb == "file-absent";
-            if (!waitFor(kTimeoutMs, [&] { return absent ? !d.fileExists(st.a) : compare(st.want, got = d.readFile(st.a)) == 1; }))
+            auto done = [&] { return absent ? !d.fileExists(st.a) : compare(st.want, got = d.readFile(st.a)) == 1; };
+            if (!eventually(done, kTimeoutMs))
                 fail(st.line, st.text + "\n  got: " + (absent ? "a file" : sim::visibleBytes(got)));
         } else if (st.verb == "log") {
-            if (!waitFor(kTimeoutMs, [&] { return d.log().find(st.b) != std::string::npos; }))
+            if (!eventually([&] { return d.log().find(st.b) != std::string::npos; }, kTimeoutMs))
                 fail(st.line, st.text + "\n  not in the daemon's log");
         } else if (st.verb == "quiet") {
             if (!(got = dev.quiet(st.timeoutMs)).empty()) fail(st.line, st.text + "\n  got: " + got);
