@@ -11,6 +11,7 @@
 
 #include "attok/at_tok.h"
 #include "core/line_edit.h"
+#include "core/prop_number.h"
 #include "core/reader.h"
 #include "core/tolkd_log.h"
 #include "dispatch/dispatcher.h"
@@ -91,7 +92,7 @@ int startMergeMsgCmdInputIfNeed(SerialDevice *dev, const char *line) {
     char sim[PROPERTY_VALUE_MAX];
     memset(sim, 0, sizeof(sim));
     property_get("persist.service.tolk.sim", sim, "0");
-    if (atoi(sim) == SIM_SELECT_CDMA) return 0;
+    if (propertyNumber(sim) == SIM_SELECT_CDMA) return 0;
 
     int count = getMsgCmdParameterCount(line);
     LOGD("startMergeMsgCmdInputIfNeed count %d msgCmdMode %d", count, msgCmdMode);

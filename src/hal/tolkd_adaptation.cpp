@@ -14,6 +14,7 @@
 
 #include <cutils/properties.h>
 
+#include "core/prop_number.h"
 #include "core/reader.h"
 #include "core/tolkd_log.h"
 #include "serial/response_writer.h"
@@ -45,15 +46,14 @@ int TolkdAdaptation::getSlotId() {
     char simNo[PROPERTY_VALUE_MAX] = {0};
     property_get("persist.service.tolk.sim", simNo, "0");
     LOGD("simNo: %s", simNo);
-    int slotId = atoi(simNo);
+    int slotId = propertyNumber(simNo);
     LOGD("slotId: %d", slotId);
     if ((unsigned int)slotId < TOLKD_SIM_SLOT_COUNT) return slotId;
     if (slotId == 9) {
         char cdmaSlot[PROPERTY_VALUE_MAX] = {0};
         property_get("persist.radio.cdma_slot", cdmaSlot, "1");
-        // Any text can sit in the property: only a slot number 1..N names a slot
-        // (atoi of "-2147483648" minus one would overflow).
-        int cdma = atoi(cdmaSlot);
+        // Only a slot number 1..N names a slot.
+        int cdma = propertyNumber(cdmaSlot);
         if (cdma >= 1 && cdma <= TOLKD_SIM_SLOT_COUNT) return cdma - 1;
         LOGE("unsupported cdma slot number.");
         return -1;

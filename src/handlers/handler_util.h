@@ -7,6 +7,7 @@
 #include <stdlib.h>
 #include <string.h>
 
+#include "core/prop_number.h"
 #include "dispatch/dispatcher.h"
 #include "serial/serial_device.h"
 
@@ -17,15 +18,6 @@
 static inline char *copyParam(const char *param, char *buf, size_t size) {
     snprintf(buf, size, "%s", param != NULL ? param : "");
     return buf;
-}
-
-// A property value read as a decimal number; text that is not a number is 0.
-// Out-of-range numbers saturate so they can never wrap onto a valid value.
-static inline int propertyNumber(const char *value) {
-    long v = strtol(value, NULL, 10);
-    if (v > INT_MAX) return INT_MAX;
-    if (v < INT_MIN) return INT_MIN;
-    return (int)v;
 }
 
 #endif

@@ -57,6 +57,7 @@ TEST_F(HalBridge, SlotComesFromTheSimSelection) {
         {"2", nullptr, 2},         {"8", nullptr, -1}, {"10", nullptr, -1},
         {"9", nullptr, 0},         // the CDMA slot defaults to the first
         {"9", "-2147483648", -1},  // regression: atoi minus one overflowed here (seen under UBSan)
+        {"4294967297", nullptr, -1}, {"9", "4294967298", -1},  // 2^32 + 1 and + 2 do not wrap onto a slot
     };
     for (const auto &c : cases) {
         TestRoot root;  // fresh properties for each case
