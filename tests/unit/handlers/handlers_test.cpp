@@ -89,8 +89,7 @@ TEST_F(HandlerTest, SimSelectionFollowsTheSimCountAndC2kMode) {
 }
 
 // Echo takes only the digits 0 and 1; a switch takes a quoted value too. (AT%EURC
-// shares the switch handler: local_commands.tx; a stored number out of range:
-// fault_root.cpp.)
+// shares the switch handler, and a stored number out of range: local_commands.tx.)
 TEST_F(HandlerTest, EchoAndPropertySwitchesTakeOnlyTheirValues) {
     gSerialDevice.echoOption[DEVICE_SERIAL] = 1;
     EXPECT_EQ(4, call(pas_echo_handler, "ATE2", AT_BASIC_OP));

@@ -137,6 +137,7 @@ TEST_F(ResponseWriterTest, FramesAnswersOnce) {
     };
     for (const auto &c : cases) EXPECT_EQ(c.second, hostGets(c.first)) << c.first;
     EXPECT_EQ("\r\nAU\r\n", hostGets("AUD", 2));
+    EXPECT_EQ("\r\n\r\n", hostGets(nullptr, 12));
     EXPECT_EQ("\r\n\r\n", hostGets("OK", -3));
     EXPECT_EQ("\r\nO\r\n", hostGets("OK", 1));
     // Beyond one full data buffer only the first 6145 bytes are looked at.
