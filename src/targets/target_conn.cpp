@@ -10,6 +10,7 @@
 #include <cutils/properties.h>
 #include <cutils/sockets.h>
 
+#include "core/prop_number.h"
 #include "core/tolkd_log.h"
 #include "dispatch/dispatcher.h"
 #include "hal/tolkd_adaptation.h"
@@ -64,7 +65,7 @@ void connectTarget(int target) {
 bool isCdmaLteDcSupport(void) {
     char value[PROPERTY_VALUE_MAX] = {0};
     property_get("ro.boot.opt_c2k_lte_mode", value, "0");
-    int mode = atoi(value);
+    int mode = propertyNumber(value);
     LOGD("isC2kLteSupport: %d", mode);
     return mode != 0;
 }

@@ -79,7 +79,8 @@ TEST_F(HandlerTest, SimSelectionFollowsTheSimCountAndC2kMode) {
     ASSERT_EQ(0, property_set("persist.radio.multisim.config", "tsts"));
     EXPECT_EQ(0, esuo("6", AT_SET_OP));
     EXPECT_EQ("2", prop("persist.service.tolk.sim"));
-    ASSERT_EQ(0, property_set("ro.boot.opt_c2k_lte_mode", "1"));
+    // Any number but 0 is C2K mode; 2^32 must not wrap to 0.
+    ASSERT_EQ(0, property_set("ro.boot.opt_c2k_lte_mode", "4294967296"));
     EXPECT_EQ(0, esuo("9", AT_SET_OP));
     EXPECT_EQ("9", prop("persist.service.tolk.sim"));
     EXPECT_EQ(4, esuo("6", AT_SET_OP)) << "no SIM 3 in C2K mode, even on a triple-SIM device";
