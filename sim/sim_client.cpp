@@ -8,6 +8,7 @@
 #include <termios.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cctype>
 #include <cstdio>
 #include <cstring>
@@ -19,9 +20,8 @@ namespace sim {
 
 namespace {
 
-// After a final result the answer may still have a trailing line (a handler's
-// own "OK" followed by the dispatcher's): wait this long for more.
-const int kTrailingGapMs = 50;
+// The console's piped mode: how long a line without a complete answer waits.
+const int kPipedSilenceMs = 300;
 
 bool isFinalLine(const std::string &l, bool numeric) {
     static const char *const finals[] = {
@@ -35,6 +35,39 @@ bool isFinalLine(const std::string &l, bool numeric) {
     if (l.compare(0, 10, "+CME ERROR") == 0 || l.compare(0, 10, "+CMS ERROR") == 0) return true;
     if (numeric && l.size() == 1 && l[0] >= '0' && l[0] <= '8') return true;
     return false;
+}
+
+// Commands whose answer the daemon relays from the audio service as it comes,
+// one answer per command and no final result added: the audio commands and the
+// device maker's test commands (whose answers are raw byte frames).
+const char *const kRelayedWhole[] = {
+    "AUD+",          "MM+",         "AT+EAPS",       "AT+EADP",         "AT^MMITESTENABLE",
+    "AT^MMITEST",    "AT^ALLVER?",  "AT^TMMI",       "AT^RUNTEST?",     "AT^BSN?",
+    "AT^FACINFO",    "AT^TCHRENABLE", "AT^TBATLVL",  "AT^IINLIMIT=1",   "AT^POWERDOWN",
+    "AT+AUDLOOP=",   "AT+FMTEST",
+};
+
+bool isRelayedWhole(const std::string &line) {
+    std::string t = trimBlanks(line);
+    for (const char *prefix : kRelayedWhole)
+        if (startsWithNoCase(t, prefix)) return true;
+    return false;
+}
+
+// What ATV0 / ATV1 (ATV alone is ATV0) make of the numeric mode.
+bool numericAfter(const std::string &line, bool numeric) {
+    std::string t = trimBlanks(line);
+    if (equalsNoCase(t, "ATV") || equalsNoCase(t, "ATV0")) return true;
+    if (equalsNoCase(t, "ATV1")) return false;
+    return numeric;
+}
+
+int gInterruptFd = -1;
+
+bool interrupted() {
+    if (gInterruptFd < 0) return false;
+    struct pollfd p = {gInterruptFd, POLLIN, 0};
+    return poll(&p, 1, 0) > 0;
 }
 
 int openLink(const std::string &root, bool adb, std::string *err) {
@@ -89,14 +122,6 @@ bool writeAllTo(int fd, const std::string &data, long long deadline) {
     return true;
 }
 
-bool startsWithNoCase(const std::string &s, const char *prefix) {
-    size_t n = strlen(prefix);
-    if (s.size() < n) return false;
-    for (size_t i = 0; i < n; i++)
-        if (toupper(static_cast<unsigned char>(s[i])) != prefix[i]) return false;
-    return true;
-}
-
 }  // namespace
 
 bool hasFinalResult(const std::string &received, bool numeric) {
@@ -116,97 +141,138 @@ bool hasFinalResult(const std::string &received, bool numeric) {
            received.compare(received.size() - prompt.size(), prompt.size(), prompt) == 0;
 }
 
+bool isCompleteAnswer(const std::string &sent, const std::string &received, bool numeric) {
+    // The daemon's echo of the line ("LINE\n"), or the terminal's own after a
+    // replug, before the daemon has set the port up ("LINE\r\n").
+    std::string line = sent;
+    while (!line.empty() && (line.back() == '\r' || line.back() == '\n')) line.pop_back();
+    std::string rest = received;
+    for (const char *end : {"\r\n", "\n"}) {
+        std::string echo = line + end;
+        if (!line.empty() && rest.compare(0, echo.size(), echo) == 0) {
+            rest.erase(0, echo.size());
+            break;
+        }
+    }
+    if (hasFinalResult(rest, numeric)) return true;
+    return !rest.empty() && isRelayedWhole(line);
+}
+
+void setInterruptFd(int fd) { gInterruptFd = fd; }
+
 int cmdAt(const AtOptions &opt) {
     std::vector<std::string> payloads;
     for (const auto &l : opt.lines) {
         std::string bytes = l, err;
         if (!opt.rawLines && !decodeEscapes(l, &bytes, &err)) {
             fprintf(stderr, "tolk-sim at: %s\n", err.c_str());
-            return 2;
+            return kExitUsage;
         }
-        if (!opt.noCr) bytes.push_back('\r');
         payloads.push_back(bytes);
     }
     std::string err;
     int fd = openLink(opt.root, opt.adb, &err);
     if (fd < 0) {
         fprintf(stderr, "tolk-sim at: %s\n", err.c_str());
-        return 1;
+        return kExitFailed;
     }
-    long long deadline = nowMs() + static_cast<long long>(opt.timeoutSec) * 1000;
-    bool numeric = false;
+    bool numeric = opt.numeric;
     char buf[8192];
-    for (const auto &p : payloads) {
-        if (startsWithNoCase(p, "ATV0")) numeric = true;
-        if (startsWithNoCase(p, "ATV1")) numeric = false;
+    for (const auto &line : payloads) {
+        numeric = numericAfter(line, numeric);
+        std::string p = opt.noCr ? line : line + "\r";
+        long long deadline = nowMs() + opt.timeoutMs;
         if (!writeAllTo(fd, p, deadline)) {
             fprintf(stderr, "tolk-sim at: cannot send %s: %s\n", visibleBytes(p).c_str(), strerror(errno));
             close(fd);
-            return 1;
+            return kExitFailed;
         }
         std::string received;
-        bool final = false;
+        bool complete = false;
+        long long lastByte = nowMs();
         for (;;) {
-            long long left = deadline - nowMs();
-            if (left <= 0) {
-                fprintf(stderr, "tolk-sim at: timed out after %d s\n", opt.timeoutSec);
+            if (interrupted()) {
                 close(fd);
-                return 1;
+                return kExitFailed;
             }
-            int wait = final ? kTrailingGapMs : opt.quietMs;
-            if (wait > left) wait = static_cast<int>(left);
-            struct pollfd pf = {fd, POLLIN, 0};
-            int r = poll(&pf, 1, wait);
+            long long now = nowMs();
+            if (complete && now - lastByte >= opt.quietMs) break;  // the answer and its tail are in
+            if (!complete && opt.silenceEnds && now - lastByte >= opt.quietMs) break;
+            if (now >= deadline) {
+                if (complete) break;  // a link that never goes quiet: the answer is in all the same
+                fflush(stdout);
+                fprintf(stderr, "tolk-sim at: no complete answer to %s within %d.%03d s%s\n",
+                        visibleBytes(line).c_str(), opt.timeoutMs / 1000, opt.timeoutMs % 1000,
+                        !numeric && hasFinalResult(received, true)
+                            ? " (a numeric result code came: if an earlier ATV0 is in force, give --numeric)"
+                            : "");
+                close(fd);
+                return kExitNoAnswer;
+            }
+            long long wait = deadline - now;
+            if (complete || opt.silenceEnds) wait = std::min<long long>(wait, lastByte + opt.quietMs - now);
+            struct pollfd pf[2] = {{fd, POLLIN, 0}, {gInterruptFd, POLLIN, 0}};
+            int r = poll(pf, gInterruptFd >= 0 ? 2 : 1, static_cast<int>(std::max<long long>(wait, 0)));
             if (r < 0 && errno == EINTR) continue;
-            if (r == 0) {
-                if (nowMs() >= deadline) continue;  // reported above
-                break;                              // quiet: this line is done
-            }
+            if (r <= 0 || !(pf[0].revents & (POLLIN | POLLHUP | POLLERR))) continue;
             ssize_t n = read(fd, buf, sizeof buf);
             if (n < 0 && (errno == EINTR || errno == EAGAIN)) continue;
             if (n <= 0) {
                 fflush(stdout);
                 fprintf(stderr, "tolk-sim at: the link was closed\n");
                 close(fd);
-                return 1;
+                return kExitFailed;
             }
             fwrite(buf, 1, static_cast<size_t>(n), stdout);
             fflush(stdout);
             received.append(buf, static_cast<size_t>(n));
-            if (!final && hasFinalResult(received, numeric)) final = true;
+            lastByte = nowMs();
+            if (!complete) complete = isCompleteAnswer(line, received, numeric);
         }
     }
     close(fd);
-    return 0;
+    return kExitOk;
 }
 
 int cmdConsole(const std::string &root, bool adb) {
     if (!isatty(0)) {
         // Piped input: one exchange per line, as a host program would do it
-        // (the adb link takes one line per packet).
+        // (the adb link takes one line per packet). A line that gets no
+        // complete answer ends after a short silence: the console waits for
+        // nobody, a script wanting certainty uses `at`.
         AtOptions opt;
         opt.root = root;
         opt.adb = adb;
         opt.rawLines = true;
-        opt.timeoutSec = 3600;
+        opt.silenceEnds = true;
+        opt.quietMs = kPipedSilenceMs;
         std::string line;
-        int c;
-        while ((c = getchar()) != EOF) {
-            if (c == '\n') {
-                opt.lines.push_back(line);
-                line.clear();
-            } else {
-                line.push_back(static_cast<char>(c));
+        char in[4096];
+        for (;;) {
+            struct pollfd p[2] = {{0, POLLIN, 0}, {gInterruptFd, POLLIN, 0}};
+            int r = poll(p, gInterruptFd >= 0 ? 2 : 1, -1);
+            if (r < 0 && errno == EINTR) continue;
+            if (interrupted()) return kExitFailed;
+            ssize_t n = read(0, in, sizeof in);
+            if (n < 0 && errno == EINTR) continue;
+            if (n <= 0) break;
+            for (ssize_t i = 0; i < n; i++) {
+                if (in[i] == '\n') {
+                    opt.lines.push_back(line);
+                    line.clear();
+                } else {
+                    line.push_back(in[i]);
+                }
             }
         }
         if (!line.empty()) opt.lines.push_back(line);
-        return opt.lines.empty() ? 0 : cmdAt(opt);
+        return opt.lines.empty() ? kExitOk : cmdAt(opt);
     }
     std::string err;
     int fd = openLink(root, adb, &err);
     if (fd < 0) {
         fprintf(stderr, "tolk-sim console: %s\n", err.c_str());
-        return 1;
+        return kExitFailed;
     }
     bool tty = isatty(0);
     struct termios saved;
@@ -225,15 +291,20 @@ int cmdConsole(const std::string &root, bool adb) {
     char buf[4096];
     int rc = 0;
     for (;;) {
-        struct pollfd p[2] = {{fd, POLLIN, 0}, {0, static_cast<short>(stdinOpen ? POLLIN : 0), 0}};
-        int r = poll(p, 2, stdinOpen ? -1 : 100);
+        struct pollfd p[3] = {{fd, POLLIN, 0}, {0, static_cast<short>(stdinOpen ? POLLIN : 0), 0},
+                              {gInterruptFd, POLLIN, 0}};
+        int r = poll(p, gInterruptFd >= 0 ? 3 : 2, stdinOpen ? -1 : 100);
         if (r < 0 && errno == EINTR) continue;
+        if (interrupted()) {
+            rc = kExitFailed;
+            break;
+        }
         if (!stdinOpen && nowMs() - eofAt > 500) break;  // piped input: let the answers arrive
         if (p[0].revents & (POLLIN | POLLHUP | POLLERR)) {
             ssize_t n = read(fd, buf, sizeof buf);
             if (n == 0 || (n < 0 && errno != EAGAIN && errno != EINTR)) {
                 fprintf(stderr, "\r\n[the link was closed]\r\n");
-                rc = 1;
+                rc = kExitFailed;
                 break;
             }
             if (n > 0) {
@@ -260,7 +331,7 @@ int cmdConsole(const std::string &root, bool adb) {
             }
             if (!out.empty() && !writeAllTo(fd, out, nowMs() + 5000)) {
                 fprintf(stderr, "\r\n[cannot write to the link]\r\n");
-                rc = 1;
+                rc = kExitFailed;
                 break;
             }
             if (quit) break;

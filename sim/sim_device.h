@@ -15,7 +15,7 @@ struct UpOptions {
     bool writeBootMode = true;
     std::string bootMode = "0";
     bool controlSocket = true;
-    std::string logTags = "*:i";
+    std::string logTags = "*:i";  // checked by parseUpOptions: logcat filter syntax
     std::vector<std::string> adcLines;  // "CHANNEL VALUE STATUS"
     std::string modemTty;
     bool nvram = true;
@@ -32,8 +32,11 @@ struct UpOptions {
 bool parseUpOptions(const std::vector<std::string> &args, size_t i, UpOptions *opt, std::string *err,
                     std::vector<std::string> *extra = nullptr);
 
-// Brings the device up; returns the process exit status of `up`.
-int cmdUp(UpOptions opt);
+// Brings the device up; returns the process exit status of `up`. started (if
+// given) tells whether a supervisor of this call is left running: always after
+// success, and after a daemon that ended or did not serve, which stays for a
+// look at its state until `down`.
+int cmdUp(UpOptions opt, bool *started = nullptr);
 // Stops everything started for root; idempotent. Returns 0 when nothing is left.
 int cmdDown(const std::string &root);
 

@@ -110,21 +110,34 @@ bool parsePort(const std::string &address, int *port) {
 
 }  // namespace
 
+bool checkForwardArgs(const std::vector<std::string> &args, std::string *err) {
+    int port = -1;
+    for (const auto &a : args) {
+        if (a == "--background") continue;
+        if (port < 0 && parsePort(a, &port)) continue;
+        *err = "tcp:PORT expected, got '" + a + "'";
+        return false;
+    }
+    if (port < 0) {
+        *err = "tcp:PORT is required (tcp:0 picks a free port)";
+        return false;
+    }
+    return true;
+}
+
 int cmdForward(const std::string &root, const std::vector<std::string> &args) {
+    std::string err;
+    if (!checkForwardArgs(args, &err)) {
+        fprintf(stderr, "tolk-sim forward: %s\n", err.c_str());
+        return kExitUsage;
+    }
     int port = -1;
     bool background = false;
     for (const auto &a : args) {
-        if (a == "--background") {
+        if (a == "--background")
             background = true;
-        } else if (port < 0 && parsePort(a, &port)) {
-        } else {
-            fprintf(stderr, "tolk-sim forward: tcp:PORT expected, got '%s'\n", a.c_str());
-            return 2;
-        }
-    }
-    if (port < 0) {
-        fprintf(stderr, "tolk-sim forward: tcp:PORT is required (tcp:0 picks a free port)\n");
-        return 2;
+        else
+            parsePort(a, &port);
     }
     std::string adb = RootLayout{root}.adbSocket();
 

@@ -17,6 +17,8 @@ int cmdHost(const std::string &root, const std::vector<std::string> &command);
 // connection accepted on 127.0.0.1:PORT to the adb control socket until SIGINT
 // or SIGTERM.
 int cmdForward(const std::string &root, const std::vector<std::string> &args);
+// Whether args are forward's ([--background] tcp:PORT); err says what is wrong.
+bool checkForwardArgs(const std::vector<std::string> &args, std::string *err);
 
 }  // namespace sim
 

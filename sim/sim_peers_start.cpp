@@ -106,21 +106,33 @@ bool Supervisor::peerReady(const std::string &name) {
     return true;
 }
 
-void Supervisor::waitForPeers() {
+// Every peer must serve before tolkd starts: a device with a peer missing
+// would answer differently from the one a test or a station asked for.
+bool Supervisor::waitForPeers(std::string *err) {
     long long deadline = nowMs() + kPeerReadyTimeoutMs;
     for (;;) {
         reapChildren();
+        for (const auto &p : peers_) {
+            if (p.second <= 0) {
+                *err = "peer " + p.first + " ended at start (see " + L_.peerLog(p.first) + ")";
+                return false;
+            }
+        }
         bool all = true;
         for (const auto &p : peers_)
-            if (p.second > 0 && !peerReady(p.first)) all = false;
-        if (all) return;
+            if (!peerReady(p.first)) all = false;
+        if (all) return true;
         if (nowMs() >= deadline) break;
         sleepMs(10);
     }
-    for (const auto &p : peers_)
-        if (p.second > 0 && !peerReady(p.first))
-            log("peer %s is not serving after %d ms; starting tolkd anyway", p.first.c_str(),
-                kPeerReadyTimeoutMs);
+    for (const auto &p : peers_) {
+        if (!peerReady(p.first)) {
+            *err = "peer " + p.first + " is not serving after " + std::to_string(kPeerReadyTimeoutMs) + " ms (see " +
+                   L_.peerLog(p.first) + ")";
+            break;
+        }
+    }
+    return false;
 }
 
 

@@ -287,9 +287,16 @@ void Supervisor::shutdownAll() {
     setCable(false);  // the device is gone: a host sees its carrier drop
     if (linesFd_ >= 0) close(linesFd_);
     linesFd_ = -1;
+    // Nothing of this device may be reached through the root any more: the
+    // terminals' numbers go to the next device that asks for one.
+    unlink(L_.deviceTty().c_str());
+    unlink(L_.hostTty().c_str());
+    unlink(L_.adbSocket().c_str());
     unlink(L_.ctlSocket().c_str());
     unlink(L_.pidFile("supervisor").c_str());
     log("down");
+    if (lockFd_ >= 0) close(lockFd_);  // the next `up` may start
+    lockFd_ = -1;
 }
 
 int Supervisor::run() {
@@ -299,15 +306,27 @@ int Supervisor::run() {
     std::string err;
     if (!setUp(&err)) {
         log("%s", err.c_str());
+        shutdownAll();
         ready("error " + err);
         return 1;
     }
-    for (const auto &name : peerNames()) spawnPeer(name);
-    waitForPeers();
+    for (const auto &name : peerNames()) {
+        if (spawnPeer(name) < 0) {
+            shutdownAll();
+            ready("error cannot start peer " + name);
+            return 1;
+        }
+    }
+    if (!waitForPeers(&err)) {
+        log("%s", err.c_str());
+        shutdownAll();
+        ready("error " + err);
+        return 1;
+    }
     tolkd_ = spawnTolkd();
     if (tolkd_ < 0) {
-        ready("error cannot fork tolkd");
         shutdownAll();
+        ready("error cannot fork tolkd");
         return 1;
     }
     // init keeps no copy of a service's socket once the service has it.

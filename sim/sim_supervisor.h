@@ -42,7 +42,10 @@ void prepareRoot(const UpOptions &opt, std::string *err);
 
 class Supervisor {
 public:
-    Supervisor(const UpOptions &opt, int readyFd) : opt_(opt), L_{opt.root}, readyFd_(readyFd) {}
+    // readyFd: where the outcome of the start goes to `up`; lockFd: the root's
+    // lock, held until everything is down (the supervisor closes both).
+    Supervisor(const UpOptions &opt, int readyFd, int lockFd)
+        : opt_(opt), L_{opt.root}, readyFd_(readyFd), lockFd_(lockFd) {}
     int run();
 
 private:
@@ -60,7 +63,7 @@ private:
     void shutdownAll();
     // sim_peers_start.cpp
     pid_t spawnPeer(const std::string &name);
-    void waitForPeers();
+    bool waitForPeers(std::string *err);
     bool peerReady(const std::string &name);
     std::string stopPeer(const std::string &name);
     std::string startPeer(const std::string &name);
@@ -80,6 +83,7 @@ private:
     UpOptions opt_;
     RootLayout L_;
     int readyFd_;
+    int lockFd_;
     std::string self_;
     FILE *log_ = nullptr;
     int signalFd_ = -1;  // read end of the signal pipe (owned by sim_supervisor.cpp)

@@ -2,6 +2,7 @@
 
 #include <errno.h>
 #include <fcntl.h>
+#include <ftw.h>
 #include <poll.h>
 #include <signal.h>
 #include <sys/socket.h>
@@ -97,6 +98,13 @@ std::string readFileOr(const std::string &path, const std::string &fallback) {
 bool fileExists(const std::string &path) {
     struct stat st;
     return lstat(path.c_str(), &st) == 0;
+}
+
+static int removeEntry(const char *path, const struct stat *, int, struct FTW *) { return remove(path); }
+
+bool removeTree(const std::string &path) {
+    nftw(path.c_str(), removeEntry, 16, FTW_DEPTH | FTW_PHYS);
+    return !fileExists(path);
 }
 
 std::string tailLines(const std::string &path, int n) {

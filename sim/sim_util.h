@@ -11,6 +11,15 @@
 
 namespace sim {
 
+// Exit statuses of every tolk-sim subcommand (a host program run by `host` keeps
+// its own). Station scripts branch on them, so each means one thing only.
+enum ExitStatus {
+    kExitOk = 0,
+    kExitFailed = 1,    // the device is not up, a link failed, the operation was refused
+    kExitUsage = 2,     // wrong invocation: unknown command or option, bad value
+    kExitNoAnswer = 3,  // `at`: a line got no complete answer within --timeout
+};
+
 // Where things live under the device root DIR.
 struct RootLayout {
     std::string root;  // absolute
@@ -26,6 +35,9 @@ struct RootLayout {
     std::string supervisorLog() const { return path("log/sim.log"); }
     std::string tolkdStatus() const { return path("run/tolkd.status"); }
     std::string pidFile(const std::string &name) const { return path("run/" + name + ".pid"); }
+    // Held with flock by `up` while it runs and by the supervisor while the
+    // device is up: one device per root.
+    std::string lockFile() const { return path("run/device.lock"); }
     std::string peerLog(const std::string &name) const { return path("log/" + name + ".log"); }
 };
 
@@ -42,6 +54,8 @@ bool writeFile(const std::string &path, const std::string &content);
 bool readFile(const std::string &path, std::string *content);
 std::string readFileOr(const std::string &path, const std::string &fallback = "");
 bool fileExists(const std::string &path);
+// rm -rf without following symbolic links; true when nothing is left.
+bool removeTree(const std::string &path);
 // The last n lines of a file (for failure reports).
 std::string tailLines(const std::string &path, int n);
 

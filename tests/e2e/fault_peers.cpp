@@ -12,6 +12,8 @@
 const std::string kCsq = "\r\n+CSQ: 20,99\r\n\r\nOK\r\n";
 const std::string kNoModem = "\r\nERROR:No Modem\r\n";
 const std::string kOk = "\r\nOK\r\n";
+// How long a command that may rightly stay unanswered is given.
+const int kSilence = 1000;
 
 // The radio service is stopped and started by another thread while the host
 // keeps sending: each command ends in its answer or "ERROR:No Modem"; only a
@@ -40,7 +42,7 @@ TEST(FaultPeers, RadioServiceFlappingUnderTraffic) {
         done = true;
     });
     std::map<std::string, int> seen;  // answers and how often each came
-    for (int commands = 0; !done && commands < 400; commands++) seen[d.at("AT+CSQ", true)]++;
+    for (int commands = 0; !done && commands < 400; commands++) seen[d.at("AT+CSQ", true, kSilence)]++;
     flapper.join();
     for (const auto &a : seen)
         EXPECT_TRUE(a.first == kCsq || a.first == kNoModem || a.first.empty()) << visible(a.first);
@@ -52,10 +54,10 @@ TEST(FaultPeers, RadioServiceFlappingUnderTraffic) {
     EXPECT_EQ(answered + 1 + 1, countOf(d.readFile("/journal/radio.slot1.log"), "-1\tAT+CSQ\\x00\n") - silent)
         << answered << " answered, " << silent << " silent";
 
-    d.at(std::vector<std::string>{"AT+MODEL", "MM+LOOP=1", "AT*CIT_KEY"}, true);  // hang-ups
+    for (const char *hangUp : {"AT+MODEL", "MM+LOOP=1", "AT*CIT_KEY"}) d.at(hangUp, true, kSilence);
     const char *const held[][2] = {{"AT+POWERKEY", "generic"}, {"AUD+TXT", "audio"}, {"AT*CIT_GPS", "cit"}};
     for (const auto &h : held) {  // the peer stopped while the daemon waits on it
-        d.at(h[0], true);
+        d.at(h[0], true, kSilence);
         simOk(d, {"stop", h[1]});
         simOk(d, {"start", h[1]});
     }

@@ -1,17 +1,24 @@
-// The simulator's host-side promises that tests and host tools lean on: the host
-// port has the modem lines of a USB ACM port, and the forwarder serves the adb
-// link on a loopback TCP port. (That `start` returns once the peer accepts is
-// met by every test that restarts a peer and sends its next command at once.)
-// Real host programs through `tolk-sim host` are in host_clients.cpp.
+// The simulator's own promises that tests, station scripts and host tools lean
+// on: exit statuses that tell the truth, one device per root and nothing of it
+// left once it is down, the host port with the modem lines of a USB ACM port,
+// and the forwarder serving the adb link on a loopback TCP port. (That `start`
+// returns once the peer accepts is met by every test that restarts a peer and
+// sends its next command at once.) Real host programs through `tolk-sim host`
+// are in host_clients.cpp.
 #include <arpa/inet.h>
+#include <dirent.h>
 #include <dlfcn.h>
+#include <fcntl.h>
 #include <linux/serial.h>
 #include <poll.h>
 #include <signal.h>
+#include <stdlib.h>
 #include <sys/ioctl.h>
 #include <sys/socket.h>
 #include <sys/wait.h>
 #include <unistd.h>
+
+#include <thread>
 
 #include <gtest/gtest.h>
 
@@ -39,6 +46,205 @@ static bool ended(pid_t pid) {
     std::string stat = sim::readFileOr("/proc/" + std::to_string(pid) + "/stat");
     size_t paren = stat.rfind(')');
     return stat.empty() || (paren != std::string::npos && stat.compare(paren + 1, 3, " Z ") == 0);
+}
+
+// Pids of every process whose environment names this device root.
+static std::vector<pid_t> processesOf(const std::string &root) {
+    std::vector<pid_t> found;
+    DIR *proc = opendir("/proc");
+    while (struct dirent *e = proc ? readdir(proc) : nullptr) {
+        pid_t pid = static_cast<pid_t>(atol(e->d_name));
+        if (pid > 0 && sim::processBelongsToRoot(pid, root)) found.push_back(pid);
+    }
+    if (proc) closedir(proc);
+    return found;
+}
+
+// A folder of its own for tests that run `up` themselves; removed at the end.
+struct ScratchDir {
+    std::string path;
+    ScratchDir() {
+        char tmpl[] = "/tmp/tsXXXXXX";
+        path = mkdtemp(tmpl) ? tmpl : "";
+    }
+    ~ScratchDir() {
+        runSim({"down", "--root", path});
+        sim::removeTree(path);
+    }
+};
+
+// Wrong invocations are named and exit 2; commands that need a device refuse a
+// root that is down with 1; a failed `up` removes the folder it made.
+TEST(SimTools, WrongInvocationsAndRootsThatAreDown) {
+    ScratchDir down;
+    const std::string file = down.path + "/file", made = down.path + "/made";
+    ASSERT_TRUE(sim::writeFile(file, "x"));
+    const std::string longValue(92, 'v');
+    const struct {
+        std::vector<std::string> args;
+        int status;
+        const char *says;
+    } cases[] = {
+        {{"frobnicate"}, 2, "unknown command 'frobnicate'"},
+        {{"--version"}, 2, "unknown option '--version'"},
+        {{"up", "--root", file}, 2, "is not a directory"},
+        {{"getprop", "--root", file}, 2, "is not a directory"},
+        {{"up", "--root", made, "--log-tags", "garbage!!"}, 2, "--log-tags"},
+        {{"up", "--root", made, "--log-tags", "TOLKD:x"}, 2, "--log-tags"},
+        {{"up", "--root", made, "--prop", "persist.x=" + longValue}, 1, "was refused"},
+        {{"at", "--root", down.path}, 2, "no LINE"},
+        {{"at", "--root", down.path, "--timeout", "0", "AT"}, 2, "--timeout"},
+        {{"at", "--root", down.path, "--quiet-ms", "1x", "AT"}, 2, "--quiet-ms"},
+        {{"at", "--root", down.path, "--frob", "AT"}, 2, "unknown option '--frob'"},
+        {{"urc", "--root", down.path, "--slot", "9", "X"}, 2, "--slot"},
+        {{"forward", "--root", down.path, "tcp:x"}, 2, "tcp:PORT"},
+        {{"pause-host", "--root", down.path, "soon"}, 2, "MS"},
+        {{"at", "--root", down.path, "AT"}, 1, "no simulated device is up"},
+        {{"console", "--root", down.path}, 1, "no simulated device is up"},
+        {{"forward", "--root", down.path, "--background", "tcp:0"}, 1, "no simulated device is up"},
+        {{"host", "--root", down.path, "--", "true"}, 1, "no simulated device is up"},
+        {{"urc", "--root", down.path, "X"}, 1, "no simulated device is up"},
+        {{"replug", "--root", down.path}, 1, "no simulated device is up"},
+    };
+    for (const auto &c : cases) {
+        std::string out, all;
+        for (const auto &a : c.args) all += a + " ";
+        SCOPED_TRACE(all);
+        EXPECT_EQ(c.status, runSim(c.args, &out, true)) << out;
+        EXPECT_NE(std::string::npos, out.find(c.says)) << out;
+        EXPECT_FALSE(sim::fileExists(made)) << "a failed up leaves the folder it made";
+    }
+}
+
+// A root that is down keeps no link to a terminal: the kernel gives its number
+// to the next device, and an old link would reach that one. Even a stale link
+// that names another device's terminal is not used.
+TEST(SimTools, ARootThatIsDownReachesNoOtherDevice) {
+    SimDevice old, other({"--prop", "persist.service.tolk.usermode=1"});
+    ASSERT_TRUE(old.started() && other.started()) << old.upOutput() << other.upOutput();
+    const std::string link = old.root() + "/host/ttyACM0";
+    EXPECT_EQ("", old.sim({"down"}));
+    for (const char *gone : {"/host/ttyACM0", "/dev/ttyGS0", "/dev/socket/adb_tolk_socket", "/run/sim.ctl"})
+        EXPECT_FALSE(old.fileExists(gone)) << gone;
+    ASSERT_EQ(0, symlink(other.env("TOLK_HOST_TTY").c_str(), link.c_str()));
+    std::string out;
+    EXPECT_EQ(1, runSim({"at", "--root", old.root(), "AT*CIT_Start", "AT+CGSN"}, &out, true)) << out;
+    EXPECT_EQ(1, runSim({"console", "--root", old.root()}, &out, true)) << out;
+    EXPECT_EQ("", other.readFile("/journal/radio.slot1.log"));
+    EXPECT_EQ("\r\nOK\r\n", other.at("AT", true));
+}
+
+// `at` exits 0 only when every line got a complete answer, however late and
+// whatever form it takes, and says so when none came.
+TEST(SimTools, AtWaitsForACompleteAnswer) {
+    SimDevice d({}, [](SimDevice &dev) {
+        dev.writeFile("/sim/radio/script", "AT+SLOW => (delay 1000) \\r\\n+SLOW: 1\\r\\n\\r\\nOK\\r\\n\n");
+        dev.writeFile("/sim/generic/script", "AT+SN => (none)\n");
+        dev.writeFile("/sim/audio/script", "AT^BSN? => (delay 500) \\xfd\\x00\\r\\n3\nAUD+BIN => AUD\\x00\\r\\n\\x01\n");
+    });
+    ASSERT_TRUE(d.started()) << d.upOutput();
+    const struct {
+        const char *usermode;
+        std::vector<std::string> args;
+        int status;
+        std::string answer;
+    } cases[] = {
+        // The user-mode refusal carries no final result by design.
+        {"0", {"--adb", "AT+CSQ"}, 0, "\r\nNot access to modem in User Mode.\r\n"},
+        {"0", {"--adb", "AT+SN", "--timeout", "0.5"}, 3, ""},
+        // Raw answers of the audio service, the echo on the serial link before them.
+        {"0", {"AT^BSN?"}, 0, std::string("AT^BSN?\n\xfd\0\r\n3", 13)},
+        {"0", {"--adb", "AUD+BIN"}, 0, std::string("AUD\0\r\n\x01", 7)},
+        {"1", {"--adb", "AT+SLOW"}, 0, "\r\n+SLOW: 1\r\n\r\nOK\r\n"},
+        {"1", {"--adb", "ATV0", "AT+CSDF=1,2"}, 0, "\r\n0\r\n\r\n0\r\n"},
+        {"1", {"--adb", "AT+CSDF=1,1", "--timeout", "0.5"}, 3, "\r\n0\r\n"},
+        {"1", {"--adb", "--numeric", "AT+CSDF=1,1", "ATV1"}, 0, "\r\n0\r\n\r\nOK\r\n"},
+    };
+    for (const auto &c : cases) {
+        std::vector<std::string> args = {"at"};
+        args.insert(args.end(), c.args.begin(), c.args.end());
+        std::string all;
+        for (const auto &a : args) all += a + " ";
+        SCOPED_TRACE(all);
+        if (d.getprop("persist.service.tolk.usermode") != c.usermode)
+            d.setprop("persist.service.tolk.usermode", c.usermode);
+        int status = -1;
+        EXPECT_EQ(visible(c.answer), visible(d.sim(args, &status)));
+        EXPECT_EQ(c.status, status);
+    }
+    int status = -1;
+    // Right after a replug the fresh terminal echoes the line itself: no answer.
+    d.sim({"replug"});
+    std::string answer = d.sim({"at", "AT"}, &status);
+    EXPECT_EQ(0, status);
+    EXPECT_EQ("\r\nOK\r\n", answer.substr(answer.size() - 6)) << visible(answer);
+    // The cable pulled for good: tolkd exits, and `at` says so at once.
+    d.sim({"unplug"});
+    EXPECT_EQ(1, d.tolkdExitStatus());
+    EXPECT_EQ("", d.sim({"at", "AT"}, &status));
+    EXPECT_EQ(1, status);
+}
+
+// One device per root: a second `up`, at the same moment or over the orphans of
+// a killed supervisor, is refused; a peer that cannot serve fails `up`; and
+// nothing of a failed or stopped device keeps running.
+TEST(SimTools, OneDevicePerRootAndNothingLeftBehind) {
+    ScratchDir dir;
+    const std::string &root = dir.path;
+    int status[2] = {-1, -1};
+    std::string out[2];
+    std::thread second([&] { status[1] = runSim({"up", "--root", root, "-q"}, &out[1], true); });
+    status[0] = runSim({"up", "--root", root, "-q"}, &out[0], true);
+    second.join();
+    EXPECT_EQ(1, status[0] + status[1]) << out[0] << out[1];
+    EXPECT_NE(std::string::npos, (out[0] + out[1]).find("already up"));
+
+    pid_t supervisor = static_cast<pid_t>(atol(sim::readFileOr(root + "/run/supervisor.pid").c_str()));
+    ASSERT_GT(supervisor, 0);
+    kill(supervisor, SIGKILL);
+    ASSERT_TRUE(eventually([&] { return !sim::processBelongsToRoot(supervisor, root); }));
+    std::string again;
+    EXPECT_EQ(1, runSim({"up", "--root", root}, &again, true));
+    EXPECT_NE(std::string::npos, again.find("processes of an earlier device still run")) << again;
+    EXPECT_EQ(0, runSim({"down", "--root", root}));
+    EXPECT_EQ(std::vector<pid_t>{}, processesOf(root));
+
+    ASSERT_TRUE(sim::makeDirs(root + "/dev/socket/tolk-service/blocked"));  // the generic peer cannot bind
+    EXPECT_EQ(1, runSim({"up", "--root", root}, &again, true));
+    EXPECT_NE(std::string::npos, again.find("peer generic")) << again;
+    EXPECT_EQ(std::vector<pid_t>{}, processesOf(root));
+    EXPECT_FALSE(sim::fileExists(root + "/host/ttyACM0"));
+    sim::removeTree(root + "/dev/socket/tolk-service");
+    EXPECT_EQ(0, runSim({"up", "--root", root, "-q"}, &again, true)) << again;
+}
+
+// `run` brings its device down and removes its folder when it is told to stop
+// the way a terminal or a script stops it.
+TEST(SimTools, RunStopsTheDeviceOnSignals) {
+    for (int sig : {SIGHUP, SIGTERM, SIGINT}) {
+        SCOPED_TRACE(strsignal(sig));
+        int in[2], out[2];
+        ASSERT_EQ(0, pipe2(in, O_CLOEXEC));
+        ASSERT_EQ(0, pipe2(out, O_CLOEXEC));
+        pid_t run = startSim({"run"}, in[0], out[1]);
+        ASSERT_GT(run, 0);
+        close(in[0]);
+        close(out[1]);
+        std::string said = readUntil(out[0], "\n", 20000);
+        const std::string mark = "simulated device ";
+        size_t at = said.find(mark);
+        ASSERT_NE(std::string::npos, at) << said;
+        std::string root = said.substr(at + mark.size(), said.find('\n') - at - mark.size());
+        EXPECT_FALSE(processesOf(root).empty());
+        kill(run, sig);
+        int st = -1;
+        EXPECT_TRUE(eventually([&] { return waitpid(run, &st, WNOHANG) == run; }, 10000));
+        EXPECT_TRUE(WIFEXITED(st) && WEXITSTATUS(st) == 128 + sig) << st;
+        EXPECT_EQ(std::vector<pid_t>{}, processesOf(root));
+        EXPECT_FALSE(sim::fileExists(root));
+        close(in[1]);
+        close(out[0]);
+    }
 }
 
 // The interposer `tolk-sim host` preloads, called as a host program calls ioctl:

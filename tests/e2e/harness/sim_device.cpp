@@ -66,6 +66,21 @@ int runSim(const std::vector<std::string> &args, std::string *out, bool errToo) 
     return 128 + (WIFSIGNALED(status) ? WTERMSIG(status) : 0);
 }
 
+pid_t startSim(const std::vector<std::string> &args, int in, int out) {
+    pid_t pid = fork();
+    if (pid == 0) {
+        dup2(in, 0);
+        dup2(out, 1);
+        std::vector<char *> argv;
+        argv.push_back(const_cast<char *>(TOLK_SIM_BINARY));
+        for (const auto &a : args) argv.push_back(const_cast<char *>(a.c_str()));
+        argv.push_back(nullptr);
+        execv(TOLK_SIM_BINARY, argv.data());
+        _exit(127);
+    }
+    return pid;
+}
+
 SimDevice::SimDevice(const std::vector<std::string> &upArgs, const std::function<void(SimDevice &)> &beforeUp) {
     // Short: the sockets under the root must fit into 108 bytes.
     char tmpl[] = "/tmp/tsXXXXXX";
@@ -112,8 +127,8 @@ SimDevice::~SimDevice() {
     nftw(root_.c_str(), removeEntry, 16, FTW_DEPTH | FTW_PHYS);
 }
 
-std::string SimDevice::at(const std::vector<std::string> &lines, bool adb, int quietMs) {
-    std::vector<std::string> args = {"at", "--quiet-ms", std::to_string(quietMs), "--timeout", "30"};
+std::string SimDevice::at(const std::vector<std::string> &lines, bool adb, int timeoutMs) {
+    std::vector<std::string> args = {"at", "--timeout", std::to_string(timeoutMs / 1000.0)};
     if (adb) args.push_back("--adb");
     args.push_back("--");
     args.insert(args.end(), lines.begin(), lines.end());

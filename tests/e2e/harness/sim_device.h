@@ -12,6 +12,9 @@
 // Runs the tolk-sim binary built beside the tests; returns its exit status and
 // fills out with its standard output (and standard error when errToo).
 int runSim(const std::vector<std::string> &args, std::string *out = nullptr, bool errToo = false);
+// Starts tolk-sim with stdin and stdout on the given descriptors and returns
+// its pid at once (the caller waits for it).
+pid_t startSim(const std::vector<std::string> &args, int in, int out);
 
 class SimDevice {
 public:
@@ -30,10 +33,12 @@ public:
     const std::string &upOutput() const { return upOutput_; }
     const std::string &root() const { return root_; }
 
-    // `tolk-sim at [--adb] [--quiet-ms MS] LINE...`: the exact bytes the host received.
-    std::string at(const std::vector<std::string> &lines, bool adb = false, int quietMs = 300);
-    std::string at(const std::string &line, bool adb = false, int quietMs = 300) {
-        return at(std::vector<std::string>{line}, adb, quietMs);
+    // `tolk-sim at [--adb] --timeout SEC LINE...`: the exact bytes the host
+    // received. A line without a complete answer ends the call after timeoutMs
+    // (give a short one where silence is a right answer); the status is ignored.
+    std::string at(const std::vector<std::string> &lines, bool adb = false, int timeoutMs = 30000);
+    std::string at(const std::string &line, bool adb = false, int timeoutMs = 30000) {
+        return at(std::vector<std::string>{line}, adb, timeoutMs);
     }
     // Any other subcommand: `tolk-sim <args...> --root <root>`; returns its stdout.
     std::string sim(const std::vector<std::string> &args, int *status = nullptr);
