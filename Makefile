@@ -12,9 +12,19 @@ all: build
 deps:
 	@tools/ensure-deps.sh
 
+# Configures when the tree has never been configured successfully or was
+# configured with other settings (make BUILD_TYPE=Debug after a first build). The
+# stamp is written only after a configure that succeeded, so a failed one is
+# retried by the next make instead of wedging the tree.
+CONFIG_STAMP = $(BUILD)/.make-configured
+CONFIG_LINE = $(BUILD_TYPE) $(CMAKE_FLAGS)
+
 configure: deps
-	@if [ ! -f $(BUILD)/CMakeCache.txt ]; then \
-	  cmake -S . -B $(BUILD) -DCMAKE_BUILD_TYPE=$(BUILD_TYPE) $(CMAKE_FLAGS); fi
+	@if [ ! -f $(BUILD)/CMakeCache.txt ] || [ "$$(cat $(CONFIG_STAMP) 2>/dev/null)" != "$(CONFIG_LINE)" ]; then \
+	  rm -f $(CONFIG_STAMP); \
+	  cmake -S . -B $(BUILD) -DCMAKE_BUILD_TYPE=$(BUILD_TYPE) $(CMAKE_FLAGS) && \
+	  echo "$(CONFIG_LINE)" > $(CONFIG_STAMP); \
+	fi
 
 build: configure
 	cmake --build $(BUILD) -j $(JOBS)
@@ -42,5 +52,6 @@ test-arm64:
 bench: deps
 	tools/bench.sh
 
+# Every tree a target of this Makefile or a tool under tools/ builds.
 clean:
-	rm -rf $(BUILD) build-asan
+	rm -rf $(BUILD) build build-asan build-arm64 build-arm64-host build-bench build-fuzz

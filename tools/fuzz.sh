@@ -42,9 +42,11 @@ ensure_deps() {
 
 build() {
   ensure_deps
-  if [ ! -f "$BUILD/CMakeCache.txt" ]; then
+  # The stamp follows a configure that succeeded: a failed one is tried again.
+  if [ ! -f "$BUILD/.configured" ]; then
     CC=clang CXX=clang++ cmake -S "$ROOT" -B "$BUILD" -DCMAKE_BUILD_TYPE=RelWithDebInfo \
       -DTOLKD_FUZZ=ON -DTOLKD_BUILD_TESTS=OFF -DTOLKD_BUILD_BENCH=OFF >/dev/null
+    touch "$BUILD/.configured"
   fi
   cmake --build "$BUILD" --target fuzz_all -j "$JOBS"
 }
