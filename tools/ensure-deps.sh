@@ -4,6 +4,9 @@
 # `ensure-deps.sh arm64` adds the aarch64 cross toolchain and qemu-user (make test-arm64).
 set -eu
 pkgs=(cmake g++ make libgtest-dev libgmock-dev libbenchmark-dev python3-serial gammu gsm-utils wvdial)
+# The real libcutils, liblog and libutils headers: the check build.android_headers
+# compiles the daemon against them, so that a stand-in that drifted is caught.
+pkgs+=(android-libcutils-dev android-liblog-dev android-libutils-dev)
 [ "${1:-}" = arm64 ] && pkgs+=(g++-aarch64-linux-gnu qemu-user)
 need=()
 for pkg in "${pkgs[@]}"; do
