@@ -14,16 +14,20 @@ deps:
 
 # Configures when the tree has never been configured successfully or was
 # configured with other settings (make BUILD_TYPE=Debug after a first build). The
-# stamp is written only after a configure that succeeded, so a failed one is
-# retried by the next make instead of wedging the tree.
+# stamp is written only after a configure that succeeded, and a failed one
+# drops its cache (which would keep a bad setting such as a missing compiler),
+# so the next make starts afresh instead of being wedged.
 CONFIG_STAMP = $(BUILD)/.make-configured
 CONFIG_LINE = $(BUILD_TYPE) $(CMAKE_FLAGS)
 
 configure: deps
 	@if [ ! -f $(BUILD)/CMakeCache.txt ] || [ "$$(cat $(CONFIG_STAMP) 2>/dev/null)" != "$(CONFIG_LINE)" ]; then \
 	  rm -f $(CONFIG_STAMP); \
-	  cmake -S . -B $(BUILD) -DCMAKE_BUILD_TYPE=$(BUILD_TYPE) $(CMAKE_FLAGS) && \
-	  echo "$(CONFIG_LINE)" > $(CONFIG_STAMP); \
+	  if cmake -S . -B $(BUILD) -DCMAKE_BUILD_TYPE=$(BUILD_TYPE) $(CMAKE_FLAGS); then \
+	    echo "$(CONFIG_LINE)" > $(CONFIG_STAMP); \
+	  else \
+	    rm -f $(BUILD)/CMakeCache.txt; exit 1; \
+	  fi; \
 	fi
 
 build: configure
