@@ -41,13 +41,6 @@ static bool closedWithin(int fd, int ms) {
     return poll(&p, 1, ms) == 1 && read(fd, &c, 1) == 0;
 }
 
-// Gone, or a zombie that its new parent has not reaped yet.
-static bool ended(pid_t pid) {
-    std::string stat = sim::readFileOr("/proc/" + std::to_string(pid) + "/stat");
-    size_t paren = stat.rfind(')');
-    return stat.empty() || (paren != std::string::npos && stat.compare(paren + 1, 3, " Z ") == 0);
-}
-
 // Pids of every process whose environment names this device root.
 static std::vector<pid_t> processesOf(const std::string &root) {
     std::vector<pid_t> found;
@@ -60,24 +53,24 @@ static std::vector<pid_t> processesOf(const std::string &root) {
     return found;
 }
 
+static std::string joined(const std::vector<std::string> &args) {
+    std::string all;
+    for (const auto &a : args) all += a + " ";
+    return all;
+}
+
 // A folder of its own for tests that run `up` themselves; removed at the end.
 struct ScratchDir {
-    std::string path;
-    ScratchDir() {
-        char tmpl[] = "/tmp/tsXXXXXX";
-        path = mkdtemp(tmpl) ? tmpl : "";
-    }
-    ~ScratchDir() {
-        runSim({"down", "--root", path});
-        sim::removeTree(path);
-    }
+    char path[14] = "/tmp/tsXXXXXX";
+    ScratchDir() { EXPECT_NE(nullptr, mkdtemp(path)); }
+    ~ScratchDir() { runSim({"down", "--root", path}); sim::removeTree(path); }
 };
 
 // Wrong invocations are named and exit 2; commands that need a device refuse a
 // root that is down with 1; a failed `up` removes the folder it made.
 TEST(SimTools, WrongInvocationsAndRootsThatAreDown) {
-    ScratchDir down;
-    const std::string file = down.path + "/file", made = down.path + "/made";
+    ScratchDir scratch;
+    const std::string down = scratch.path, file = down + "/file", made = down + "/made";
     ASSERT_TRUE(sim::writeFile(file, "x"));
     const std::string longValue(92, 'v');
     const struct {
@@ -92,24 +85,23 @@ TEST(SimTools, WrongInvocationsAndRootsThatAreDown) {
         {{"up", "--root", made, "--log-tags", "garbage!!"}, 2, "--log-tags"},
         {{"up", "--root", made, "--log-tags", "TOLKD:x"}, 2, "--log-tags"},
         {{"up", "--root", made, "--prop", "persist.x=" + longValue}, 1, "was refused"},
-        {{"at", "--root", down.path}, 2, "no LINE"},
-        {{"at", "--root", down.path, "--timeout", "0", "AT"}, 2, "--timeout"},
-        {{"at", "--root", down.path, "--quiet-ms", "1x", "AT"}, 2, "--quiet-ms"},
-        {{"at", "--root", down.path, "--frob", "AT"}, 2, "unknown option '--frob'"},
-        {{"urc", "--root", down.path, "--slot", "9", "X"}, 2, "--slot"},
-        {{"forward", "--root", down.path, "tcp:x"}, 2, "tcp:PORT"},
-        {{"pause-host", "--root", down.path, "soon"}, 2, "MS"},
-        {{"at", "--root", down.path, "AT"}, 1, "no simulated device is up"},
-        {{"console", "--root", down.path}, 1, "no simulated device is up"},
-        {{"forward", "--root", down.path, "--background", "tcp:0"}, 1, "no simulated device is up"},
-        {{"host", "--root", down.path, "--", "true"}, 1, "no simulated device is up"},
-        {{"urc", "--root", down.path, "X"}, 1, "no simulated device is up"},
-        {{"replug", "--root", down.path}, 1, "no simulated device is up"},
+        {{"at", "--root", down}, 2, "no LINE"},
+        {{"at", "--root", down, "--timeout", "0", "AT"}, 2, "--timeout"},
+        {{"at", "--root", down, "--quiet-ms", "1x", "AT"}, 2, "--quiet-ms"},
+        {{"at", "--root", down, "--frob", "AT"}, 2, "unknown option '--frob'"},
+        {{"urc", "--root", down, "--slot", "9", "X"}, 2, "--slot"},
+        {{"forward", "--root", down, "tcp:x"}, 2, "tcp:PORT"},
+        {{"pause-host", "--root", down, "soon"}, 2, "MS"},
+        {{"at", "--root", down, "AT"}, 1, "no simulated device is up"},
+        {{"console", "--root", down}, 1, "no simulated device is up"},
+        {{"forward", "--root", down, "--background", "tcp:0"}, 1, "no simulated device is up"},
+        {{"host", "--root", down, "--", "true"}, 1, "no simulated device is up"},
+        {{"urc", "--root", down, "X"}, 1, "no simulated device is up"},
+        {{"replug", "--root", down}, 1, "no simulated device is up"},
     };
     for (const auto &c : cases) {
-        std::string out, all;
-        for (const auto &a : c.args) all += a + " ";
-        SCOPED_TRACE(all);
+        std::string out;
+        SCOPED_TRACE(joined(c.args));
         EXPECT_EQ(c.status, runSim(c.args, &out, true)) << out;
         EXPECT_NE(std::string::npos, out.find(c.says)) << out;
         EXPECT_FALSE(sim::fileExists(made)) << "a failed up leaves the folder it made";
@@ -163,9 +155,7 @@ TEST(SimTools, AtWaitsForACompleteAnswer) {
     for (const auto &c : cases) {
         std::vector<std::string> args = {"at"};
         args.insert(args.end(), c.args.begin(), c.args.end());
-        std::string all;
-        for (const auto &a : args) all += a + " ";
-        SCOPED_TRACE(all);
+        SCOPED_TRACE(joined(args));
         if (d.getprop("persist.service.tolk.usermode") != c.usermode)
             d.setprop("persist.service.tolk.usermode", c.usermode);
         int status = -1;
@@ -190,7 +180,7 @@ TEST(SimTools, AtWaitsForACompleteAnswer) {
 // nothing of a failed or stopped device keeps running.
 TEST(SimTools, OneDevicePerRootAndNothingLeftBehind) {
     ScratchDir dir;
-    const std::string &root = dir.path;
+    const std::string root = dir.path;
     int status[2] = {-1, -1};
     std::string out[2];
     std::thread second([&] { status[1] = runSim({"up", "--root", root, "-q"}, &out[1], true); });
@@ -206,13 +196,13 @@ TEST(SimTools, OneDevicePerRootAndNothingLeftBehind) {
     std::string again;
     EXPECT_EQ(1, runSim({"up", "--root", root}, &again, true));
     EXPECT_NE(std::string::npos, again.find("processes of an earlier device still run")) << again;
-    EXPECT_EQ(0, runSim({"down", "--root", root}));
+    for (int twice = 0; twice < 2; twice++) EXPECT_EQ(0, runSim({"down", "--root", root}));
     EXPECT_EQ(std::vector<pid_t>{}, processesOf(root));
 
     ASSERT_TRUE(sim::makeDirs(root + "/dev/socket/tolk-service/blocked"));  // the generic peer cannot bind
     EXPECT_EQ(1, runSim({"up", "--root", root}, &again, true));
     EXPECT_NE(std::string::npos, again.find("peer generic")) << again;
-    EXPECT_EQ(std::vector<pid_t>{}, processesOf(root));
+    EXPECT_TRUE(eventually([&] { return processesOf(root).empty(); }));
     EXPECT_FALSE(sim::fileExists(root + "/host/ttyACM0"));
     sim::removeTree(root + "/dev/socket/tolk-service");
     EXPECT_EQ(0, runSim({"up", "--root", root, "-q"}, &again, true)) << again;
@@ -223,18 +213,15 @@ TEST(SimTools, OneDevicePerRootAndNothingLeftBehind) {
 TEST(SimTools, RunStopsTheDeviceOnSignals) {
     for (int sig : {SIGHUP, SIGTERM, SIGINT}) {
         SCOPED_TRACE(strsignal(sig));
-        int in[2], out[2];
-        ASSERT_EQ(0, pipe2(in, O_CLOEXEC));
-        ASSERT_EQ(0, pipe2(out, O_CLOEXEC));
+        int in[2], out[2];  // stdin stays open: the console waits on it
+        ASSERT_TRUE(pipe2(in, O_CLOEXEC) == 0 && pipe2(out, O_CLOEXEC) == 0);
         pid_t run = startSim({"run"}, in[0], out[1]);
-        ASSERT_GT(run, 0);
         close(in[0]);
         close(out[1]);
-        std::string said = readUntil(out[0], "\n", 20000);
-        const std::string mark = "simulated device ";
-        size_t at = said.find(mark);
-        ASSERT_NE(std::string::npos, at) << said;
-        std::string root = said.substr(at + mark.size(), said.find('\n') - at - mark.size());
+        std::string said = readUntil(out[0], "\n", 20000), mark = "simulated device ";
+        ASSERT_NE(std::string::npos, said.find(mark)) << said;
+        size_t from = said.find(mark) + mark.size();
+        std::string root = said.substr(from, said.find('\n', from) - from);
         EXPECT_FALSE(processesOf(root).empty());
         kill(run, sig);
         int st = -1;
@@ -340,5 +327,6 @@ TEST(SimHostTools, ForwarderRelaysTheAdbLinkOverLoopbackTcp) {
     close(second);
 
     kill(pid, SIGTERM);
-    EXPECT_TRUE(eventually([&] { return ended(pid); }, 3000)) << "the forwarder ends at SIGTERM";
+    EXPECT_TRUE(eventually([&] { return !sim::processBelongsToRoot(pid, d.root()); }, 3000))
+        << "the forwarder ends at SIGTERM";
 }
