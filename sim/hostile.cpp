@@ -9,6 +9,24 @@ namespace sim {
 const char kNoiseLine[] = "\r\n+TSIM: NOISE\r\n";
 const char kNoiseText[] = "+TSIM: NOISE";
 
+std::string removeNoise(const std::string &raw, size_t *held) {
+    const std::string noise = kNoiseLine;
+    std::string out;
+    size_t from = 0;
+    for (size_t at; (at = raw.find(noise, from)) != std::string::npos; from = at + noise.size())
+        out.append(raw, from, at - from);
+    out.append(raw, from, std::string::npos);
+    *held = 0;
+    for (size_t n = std::min(out.size(), noise.size() - 1); n >= 3; n--) {
+        if (out.compare(out.size() - n, n, noise, 0, n) == 0) {
+            *held = n;
+            out.resize(out.size() - n);
+            break;
+        }
+    }
+    return out;
+}
+
 std::string hostileSeedFile(const std::string &root) { return root + "/sim/hostile"; }
 
 bool parseHostileSeed(const std::string &text, uint64_t *seed) {

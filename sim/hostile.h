@@ -24,6 +24,11 @@ extern const char kNoiseLine[];
 // Its text alone, to find a torn one.
 extern const char kNoiseText[];
 
+// raw with each whole noise line taken out; *held is the length of a tail that
+// may still grow into one ("\r\n+" and more: "\r\n" alone ends every answer),
+// left out of the result until more bytes decide.
+std::string removeNoise(const std::string &raw, size_t *held);
+
 // The longest gap between two pieces of a split write, and the longest wait that
 // lets answers due close together leave in one write.
 const int kHostileMaxGapMs = 3;

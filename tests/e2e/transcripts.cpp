@@ -35,27 +35,10 @@ const int kEmptyQuietMs = 300;    // an empty answer: nothing arrives for this l
 bool gHostile = false;
 uint64_t gSeed = 0;
 
-// What a link received with each whole noise line taken out; *held is the
-// length of a tail that may still grow into one and is kept back. Without
-// hostile timing the bytes are what they are.
+// What a link received, noise lines taken out (only hostile timing makes them).
 std::string withoutNoise(const std::string &raw, size_t *held) {
     *held = 0;
-    if (!gHostile) return raw;
-    const std::string noise = sim::kNoiseLine;
-    std::string out;
-    size_t from = 0;
-    for (size_t at; (at = raw.find(noise, from)) != std::string::npos; from = at + noise.size())
-        out.append(raw, from, at - from);
-    out.append(raw, from, std::string::npos);
-    // "\r\n" alone is how every answer ends: only "\r\n+" and more is held back.
-    for (size_t n = std::min(out.size(), noise.size() - 1); n >= 3; n--) {
-        if (out.compare(out.size() - n, n, noise, 0, n) == 0) {
-            *held = n;
-            out.resize(out.size() - n);
-            break;
-        }
-    }
-    return out;
+    return gHostile ? sim::removeNoise(raw, held) : raw;
 }
 
 // Expected bytes; kDigit and kAny are the answers' wildcards \d and \?.
@@ -240,12 +223,6 @@ bool parse(const std::string &path, Transcript *t, std::string *err) {
         }
         if (!ok) return *err = path + ":" + std::to_string(n) + ": cannot read: " + raw, false;
     }
-    std::vector<const Group *> all = {&t->setup};
-    for (const Group &g : t->groups) all.push_back(&g);
-    for (const Group *g : all)
-        for (const Stmt &st : g->stmts)
-            if (st.verb == "pipe" && st.items.empty())
-                return *err = path + ":" + std::to_string(st.line) + ": a pipe without | lines", false;
     return !in.bad() && (t->groups.size() || (*err = path + ": no groups", false));
 }
 
