@@ -165,9 +165,12 @@ int cmdUp(UpOptions opt) {
     // file means ordinary timing, also for a root that had one before.
     if (opt.hostile && opt.hostileSeed.empty())
         opt.hostileSeed = std::to_string(static_cast<unsigned long long>(nowMs()) ^ (unsigned)getpid());
-    if (err.empty() && opt.hostile && !(makeDirs(opt.root + "/sim") && writeFile(hostileSeedFile(opt.root), opt.hostileSeed + "\n")))
-        err = "cannot write " + hostileSeedFile(opt.root);
-    if (!opt.hostile) unlink(hostileSeedFile(opt.root).c_str());
+    std::string seedFile = hostileSeedFile(opt.root);
+    if (!opt.hostile) {
+        unlink(seedFile.c_str());
+    } else if (err.empty() && !(makeDirs(opt.root + "/sim") && writeFile(seedFile, opt.hostileSeed + "\n"))) {
+        err = "cannot write " + seedFile;
+    }
     if (!err.empty()) {
         fprintf(stderr, "tolk-sim up: %s\n", err.c_str());
         return 1;
