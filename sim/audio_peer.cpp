@@ -10,6 +10,7 @@
 #include <sys/socket.h>
 #include <unistd.h>
 
+#include <atomic>
 #include <string>
 #include <thread>
 #include <vector>
@@ -18,6 +19,7 @@
 #include <tolk_platform/local_socket.h>
 
 #include "cit_audio_script.h"
+#include "hostile.h"
 #include "peers.h"
 #include "sim_text.h"
 #include "sim_util.h"
@@ -29,11 +31,13 @@ const char kDefaultAnswer[] = "\r\nOK\r\n";
 
 struct AudioLink {
     const char *socketName;
+    std::string root;
     std::string journalPath;
     peerscript::Script script;
+    std::atomic<unsigned> connections{0};
 
-    AudioLink(const char *name, const std::string &journal, const std::string &scriptPath)
-        : socketName(name), journalPath(journal), script(scriptPath) {}
+    AudioLink(const char *name, const std::string &rootDir, const std::string &journal, const std::string &scriptPath)
+        : socketName(name), root(rootDir), journalPath(journal), script(scriptPath) {}
 };
 
 // The answer to an MMI test request frame: it carries bytes 11 to 14 of the request
@@ -49,6 +53,9 @@ std::string mmiTestAnswer(const std::string &request) {
 }
 
 void serveConnection(AudioLink *link, int conn) {
+    // Hostile timing: every answer in a few pieces, a few ms apart (each
+    // connection draws its own choices, in the order connections come).
+    sim::Hostile hostile(link->root, std::string(link->socketName) + "#" + std::to_string(link->connections++));
     std::vector<char> buf(64 * 1024);
     for (;;) {
         ssize_t n = read(conn, buf.data(), buf.size());
@@ -67,7 +74,13 @@ void serveConnection(AudioLink *link, int conn) {
         sim::sleepMs(answer.delayMs);
         if (answer.close) break;
         if (answer.none) continue;
-        if (!sim::sendAll(conn, answer.bytes)) break;
+        bool sent = true;
+        std::vector<std::string> pieces = hostile.split(answer.bytes);
+        for (size_t i = 0; sent && i < pieces.size(); i++) {
+            if (i > 0) sim::sleepMs(hostile.gapMs());
+            sent = sim::sendAll(conn, pieces[i]);
+        }
+        if (!sent) break;
     }
     close(conn);
 }
@@ -77,8 +90,8 @@ void serveConnection(AudioLink *link, int conn) {
 int run_audio_peer(const std::string &root, const std::vector<std::string> &) {
     // Lives as long as the process, which ends at SIGTERM.
     AudioLink *links[2] = {
-        new AudioLink("tolk-audio", root + "/journal/audio.log", root + "/sim/audio/script"),
-        new AudioLink("rild-tolk-md2", root + "/journal/audio-md2.log", root + "/sim/audio/md2.script"),
+        new AudioLink("tolk-audio", root, root + "/journal/audio.log", root + "/sim/audio/script"),
+        new AudioLink("rild-tolk-md2", root, root + "/journal/audio-md2.log", root + "/sim/audio/md2.script"),
     };
     pollfd fds[2];
     for (int i = 0; i < 2; i++) {

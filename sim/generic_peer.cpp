@@ -3,6 +3,7 @@
 // answers command texts from its script (a framed OK by default). Answers may be held back or delayed per command; the service
 // keeps reading and answering other messages meanwhile, so a test can tell a
 // daemon that waits for one answer from one that does not.
+#include "hostile.h"
 #include "modem_script.h"
 #include "peers.h"
 
@@ -26,6 +27,9 @@ namespace {
 
 const char kServiceName[] = "tolk-service";
 const char kMmiMark[] = "+ORVTOLKJ";
+// Hostile timing: how late an answer may be, so that answers due close together
+// leave in one write.
+const int kHostileLateMs = 8;
 
 struct Pending {
     int fd;
@@ -35,7 +39,10 @@ struct Pending {
 class GenericService {
 public:
     explicit GenericService(const std::string &root)
-        : root_(root), script_(root + "/sim/generic/script"), journal_(root + "/journal/generic.log") {}
+        : root_(root),
+          script_(root + "/sim/generic/script"),
+          journal_(root + "/journal/generic.log"),
+          hostile_(root, "generic") {}
     int run();
 
 private:
@@ -52,6 +59,8 @@ private:
     std::vector<int> clients_;
     std::vector<Pending> pending_;
     std::map<int, GenericSplitter> splitters_;  // per connection: what was read of its messages
+    sim::Hostile hostile_;
+    sim::Outbox outbox_;  // answer bytes on their way, split in hostile mode
 };
 
 void GenericService::dropClient(int fd) {
@@ -59,6 +68,7 @@ void GenericService::dropClient(int fd) {
     std::string rest = splitters_[fd].flush();
     if (!rest.empty()) journalLine(journal_, visibleBytes(rest));
     splitters_.erase(fd);
+    outbox_.drop(fd);
     close(fd);
     clients_.erase(std::remove(clients_.begin(), clients_.end(), fd), clients_.end());
     pending_.erase(std::remove_if(pending_.begin(), pending_.end(), [fd](const Pending &p) { return p.fd == fd; }),
@@ -85,7 +95,11 @@ void GenericService::serve(int fd, const std::string &msg) {
         if (msg.find(kMmiMark) != std::string::npos) return;
         sa.frames.push_back("\r\nOK\r\n");
     }
-    for (AnswerStep &step : answerSteps(sa, nowMs())) pending_.push_back(Pending{fd, std::move(step)});
+    int late = hostile_.on() ? hostile_.below(kHostileLateMs + 1) : 0;
+    for (AnswerStep &step : answerSteps(sa, nowMs())) {
+        step.due += late;
+        pending_.push_back(Pending{fd, std::move(step)});
+    }
 }
 
 void GenericService::deliverDue() {
@@ -94,10 +108,28 @@ void GenericService::deliverDue() {
     std::vector<Pending> due, keep;
     for (Pending &p : pending_) (p.step.ready(now, released) ? due : keep).push_back(p);
     pending_.swap(keep);
+    // What is due together for one connection goes into the outbox as one
+    // write (in hostile mode cut into pieces there); a close waits for what
+    // was due before it.
+    std::map<int, std::string> together;
+    auto post = [&](int fd) {
+        outbox_.push(fd, together[fd], now, hostile_);
+        together.erase(fd);
+    };
     for (Pending &p : due) {
         if (std::find(clients_.begin(), clients_.end(), p.fd) == clients_.end()) continue;
-        if (p.step.close || !sendAll(p.fd, p.step.frame)) dropClient(p.fd);
+        if (!p.step.close) {
+            together[p.fd] += p.step.frame;
+            continue;
+        }
+        post(p.fd);
+        sendAll(p.fd, outbox_.take(p.fd));
+        dropClient(p.fd);
     }
+    while (!together.empty()) post(together.begin()->first);
+    std::vector<int> gone;
+    outbox_.flush(now, [&](int fd, const std::string &b) { return sendAll(fd, b) || (gone.push_back(fd), false); });
+    for (int fd : gone) dropClient(fd);
 }
 
 int GenericService::run() {
@@ -115,7 +147,7 @@ int GenericService::run() {
         std::vector<struct pollfd> fds;
         fds.push_back({listenFd_, POLLIN, 0});
         for (int c : clients_) fds.push_back({c, POLLIN, 0});
-        int r = poll(fds.data(), fds.size(), stepPollTimeout(pending_, nowMs()));
+        int r = poll(fds.data(), fds.size(), outbox_.timeoutMs(nowMs(), stepPollTimeout(pending_, nowMs())));
         if (r < 0 && errno != EINTR) break;
         if (r > 0) {
             if (fds[0].revents & POLLIN) {

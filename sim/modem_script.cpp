@@ -14,9 +14,22 @@ namespace tolksim {
 
 namespace {
 
+// A (long N) answer fits one frame of the wire.
+const long kMaxLongAnswer = 60000;
+
+// (long N) HEAD...TAIL: N bytes, HEAD and TAIL around filler whose byte at
+// offset i is 'a' + i % 26 (without "...", the filler follows HEAD).
+std::string longFrame(const std::string &text, size_t n) {
+    size_t dots = text.find("...");
+    std::string head = text.substr(0, dots), tail = dots == std::string::npos ? "" : text.substr(dots + 3);
+    std::string out = head.substr(0, n);
+    while (out.size() + tail.size() < n) out.push_back(static_cast<char>('a' + out.size() % 26));
+    return (out + tail).substr(0, n);
+}
+
 // Consumes one leading "(word [arg])" directive; false when the text does not
 // start with a known one.
-bool takeDirective(std::string *text, ScriptAnswer *ans, bool *split, bool *none, std::string *err) {
+bool takeDirective(std::string *text, ScriptAnswer *ans, bool *split, bool *none, long *longLen, std::string *err) {
     std::string inner, word, arg, rest;
     if (!sim::peekDirective(*text, &inner, &word, &arg, &rest)) return false;
     if (word == "none" && arg.empty()) {
@@ -27,6 +40,11 @@ bool takeDirective(std::string *text, ScriptAnswer *ans, bool *split, bool *none
         ans->hold = true;
     } else if (word == "close" && arg.empty()) {
         ans->close = true;
+    } else if (word == "long") {
+        if (!sim::parseBoundedNumber(arg, kMaxLongAnswer, longLen)) {
+            *err = "bad length in (" + inner + ")";
+            return false;
+        }
     } else if (word == "delay" || word == "gap") {
         long v = 0;
         if (!sim::parseBoundedNumber(arg, 600000, &v)) {
@@ -60,8 +78,9 @@ int parseScriptLine(const std::string &raw, ScriptRule *rule, std::string *err) 
     r.key = matchKey(cUnescape(line.key));
     std::string text = line.answer;
     bool split = false, none = false;
+    long longLen = -1;
     std::string derr;
-    while (takeDirective(&text, &r.answer, &split, &none, &derr)) {
+    while (takeDirective(&text, &r.answer, &split, &none, &longLen, &derr)) {
     }
     if (!derr.empty()) {
         *err = derr;
@@ -78,6 +97,8 @@ int parseScriptLine(const std::string &raw, ScriptRule *rule, std::string *err) 
                 if (bar == std::string::npos) break;
                 pos = bar + 2;
             }
+        } else if (longLen >= 0) {
+            r.answer.frames.push_back(longFrame(cUnescape(text), static_cast<size_t>(longLen)));
         } else {
             r.answer.frames.push_back(cUnescape(text));
         }

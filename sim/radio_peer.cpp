@@ -4,6 +4,7 @@
 // back by a script never stop the other slots or the URC control socket. Each
 // slot is one AT channel: its answers leave in the order of its requests, and a
 // request that is not a line plus its NUL is refused and journalled as such.
+#include "hostile.h"
 #include "modem_script.h"
 #include "modem_sim.h"
 #include "peers.h"
@@ -20,6 +21,7 @@
 #include <termios.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cstdio>
 #include <memory>
 
@@ -31,9 +33,19 @@ const int kSlots = 4;
 const int kIndicationUnsolicited = 0;
 // What a refused request gets: the plain error a modem gives a line it cannot take.
 const char kRefusedAnswer[] = "\r\nERROR\r\n";
+// Hostile timing: how late an answer may be, and how often (in percent) the
+// noise line stands before or after one.
+const int kHostileLateMs = 12;
+const int kNoisePercent = 30;
 
 bool wireSend(int fd, uint32_t type, int32_t serial, int32_t extra, const std::string &payload) {
     return radio_wire_send(fd, type, serial, extra, payload.data(), static_cast<uint32_t>(payload.size())) == 0;
+}
+
+// One frame as bytes, so that several can leave in one write.
+std::string wireFrame(uint32_t type, int32_t serial, int32_t extra, const std::string &payload) {
+    RadioWireHeader h = {type, serial, extra, static_cast<uint32_t>(payload.size())};
+    return std::string(reinterpret_cast<const char *>(&h), sizeof h) + payload;
 }
 
 bool wireRecv(int fd, RadioWireHeader *h, std::string *payload) {
@@ -66,12 +78,13 @@ struct Pending {
     unsigned client;
     int32_t serial;
     AnswerStep step;
+    bool first, last;  // the answer's first and last step: where noise may stand
 };
 
 class RadioService {
 public:
     RadioService(const std::string &root, const std::string &modemTty)
-        : root_(root), modemTtyPath_(modemTty), common_(root + "/sim/radio/script") {}
+        : root_(root), modemTtyPath_(modemTty), common_(root + "/sim/radio/script"), hostile_(root, "radio") {}
 
     int run();
 
@@ -97,6 +110,7 @@ private:
     Slot slots_[kSlots];
     std::vector<Pending> pending_;
     unsigned nextClientId_ = 1;
+    sim::Hostile hostile_;
 };
 
 Client *RadioService::findClient(Slot &s, unsigned id) {
@@ -146,8 +160,14 @@ void RadioService::answer(Slot &s, unsigned id, int32_t serial, const std::strin
 }
 
 void RadioService::queueAnswer(Slot &s, unsigned id, int32_t serial, const ScriptAnswer &sa) {
-    for (AnswerStep &step : answerSteps(sa, nowMs()))
-        pending_.push_back(Pending{s.number, id, serial, std::move(step)});
+    std::vector<AnswerStep> steps = answerSteps(sa, nowMs());
+    // Hostile: each answer a few ms late by its own measure, so that a later
+    // answer due sooner waits behind it and both leave together.
+    int late = hostile_.on() ? hostile_.below(kHostileLateMs + 1) : 0;
+    for (size_t i = 0; i < steps.size(); i++) {
+        steps[i].due += late;
+        pending_.push_back(Pending{s.number, id, serial, std::move(steps[i]), i == 0, i + 1 == steps.size()});
+    }
 }
 
 void RadioService::readClient(Slot &s, unsigned id) {
@@ -252,9 +272,19 @@ void RadioService::deliverDue() {
         for (Pending &p : pending_) p.step.hold = false;
     }
     // One AT channel per slot answers in request order: a step that is not due
-    // yet holds back every later step of its slot.
+    // yet holds back every later step of its slot. What is due for one client
+    // leaves in one write (the frames stay frames: one callback each).
     bool blocked[kSlots] = {};
     std::vector<Pending> keep;
+    std::vector<std::pair<int, unsigned>> out;  // (slot index, client id), in order
+    std::vector<std::string> bytes;
+    auto flush = [&] {
+        for (size_t k = 0; k < out.size(); k++) {
+            Client *c = findClient(slots_[out[k].first], out[k].second);
+            if (c && !sendAll(c->fd, bytes[k])) dropClient(slots_[out[k].first], out[k].second);
+        }
+        out.clear(), bytes.clear();
+    };
     for (Pending &p : pending_) {
         Slot &s = slots_[p.slot - 1];
         Client *c = findClient(s, p.client);
@@ -265,13 +295,21 @@ void RadioService::deliverDue() {
             continue;
         }
         if (p.step.close) {
+            flush();
             dropClient(s, p.client);
             continue;
         }
         // Answers exist only for a client that registered its callbacks.
         if (!c->registered) continue;
-        if (!wireSend(c->fd, RADIO_WIRE_RESPONSE, p.serial, 0, p.step.frame)) dropClient(s, p.client);
+        std::pair<int, unsigned> who(p.slot - 1, p.client);
+        size_t k = std::find(out.begin(), out.end(), who) - out.begin();
+        if (k == out.size()) out.push_back(who), bytes.emplace_back();
+        std::string noise = wireFrame(RADIO_WIRE_INDICATION, -1, kIndicationUnsolicited, sim::kNoiseLine);
+        if (hostile_.on() && p.first && hostile_.chance(kNoisePercent)) bytes[k] += noise;
+        bytes[k] += wireFrame(RADIO_WIRE_RESPONSE, p.serial, 0, p.step.frame);
+        if (hostile_.on() && p.last && hostile_.chance(kNoisePercent)) bytes[k] += noise;
     }
+    flush();
     pending_.swap(keep);
 }
 

@@ -24,6 +24,8 @@ struct UpOptions {
     long nvramCount = 1;
     std::string tolkdBinary;
     bool quiet = false;  // no success summary on stdout
+    bool hostile = false;     // peers with hostile timing (hostile.h)
+    std::string hostileSeed;  // decimal; empty: one is drawn
 };
 
 // Parses the options of `up` (and of `run`, which shares them) starting at args[i].

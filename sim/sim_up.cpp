@@ -18,6 +18,7 @@
 
 #include <tolk_platform/device_root.h>
 
+#include "hostile.h"
 #include "sim_supervisor.h"
 
 #ifndef TOLKD_DEFAULT_BINARY
@@ -165,6 +166,14 @@ bool parseUpOptions(const std::vector<std::string> &args, size_t i, UpOptions *o
         } else if (a == "--tolkd") {
             if (!(v = need(a))) return false;
             opt->tolkdBinary = *v;
+        } else if (a == "--hostile" || a.compare(0, 10, "--hostile=") == 0) {
+            uint64_t seed = 0;
+            opt->hostile = true;
+            opt->hostileSeed = a.size() > 10 ? a.substr(10) : "";
+            if (!opt->hostileSeed.empty() && !parseHostileSeed(opt->hostileSeed, &seed)) {
+                *err = "--hostile=SEED needs a decimal seed, got '" + opt->hostileSeed + "'";
+                return false;
+            }
         } else if (a == "--quiet" || a == "-q") {
             opt->quiet = true;
         } else if (extra) {
@@ -260,6 +269,16 @@ int cmdUp(UpOptions opt, bool *started) {
     removeDeviceLinks(L);
     std::string err;
     prepareRoot(opt, &err);
+    // The peers read the seed when they start (and again at `start NAME`); no
+    // file means ordinary timing, also for a root that had one before.
+    if (opt.hostile && opt.hostileSeed.empty())
+        opt.hostileSeed = std::to_string(static_cast<unsigned long long>(nowMs()) ^ (unsigned)getpid());
+    std::string seedFile = hostileSeedFile(opt.root);
+    if (!opt.hostile) {
+        unlink(seedFile.c_str());
+    } else if (err.empty() && !(makeDirs(opt.root + "/sim") && writeFile(seedFile, opt.hostileSeed + "\n"))) {
+        err = "cannot write " + seedFile;
+    }
     if (!err.empty()) {
         fprintf(stderr, "tolk-sim up: %s\n", err.c_str());
         close(lockFd);
@@ -332,8 +351,9 @@ int cmdUp(UpOptions opt, bool *started) {
     if (line.compare(0, 8, "serving ") == 0) {
         if (started) *started = true;
         if (!opt.quiet)
-            printf("tolkd is serving (pid %s); root %s; environment in %s\n", line.c_str() + 8,
-                   opt.root.c_str(), L.envFile().c_str());
+            printf("tolkd is serving (pid %s); root %s; environment in %s%s\n", line.c_str() + 8,
+                   opt.root.c_str(), L.envFile().c_str(),
+                   opt.hostile ? ("; hostile timing, seed " + opt.hostileSeed).c_str() : "");
         return kExitOk;
     }
     if (line.compare(0, 7, "exited ") == 0) {

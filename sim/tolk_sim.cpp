@@ -64,6 +64,8 @@ const char kUsage[] =
     "      --no-nvram              no PRODUCT_INFO store\n"
     "      --tolkd PATH            the daemon binary to run\n"
     "      -q, --quiet             print nothing when tolkd serves\n"
+    "      --hostile[=SEED]        peers with hostile timing: answers coalesced,\n"
+    "                              split, interleaved with \"+TSIM: NOISE\" (seeded)\n"
     "  down --root DIR           stop tolkd, the peers and the supervisor (DIR stays)\n"
     "  at --root DIR [--adb] [--timeout SEC] [--quiet-ms MS] [--numeric] [--no-cr]\n"
     "     LINE...\n"

@@ -1,11 +1,15 @@
 // Plays one transcript file (tests/transcripts/*.tx, format in the README there):
 // each group is one gtest test; the groups of a file share one simulated device
 // unless a group asks for a fresh one, and its links stay open across cases.
+// With --hostile the devices run with hostile timing (sim/hostile.h), adb sends
+// are cut into pieces, and the noise line the radio service interleaves is
+// removed from what the links receive: the expected bytes stay the same.
 #include <errno.h>
 #include <fcntl.h>
 #include <poll.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <filesystem>
 #include <fstream>
 #include <map>
@@ -15,6 +19,7 @@
 #include <gtest/gtest.h>
 
 #include "../support/eventually.h"
+#include "hostile.h"
 #include "sim_device.h"
 #include "sim_text.h"
 #include "sim_util.h"
@@ -24,6 +29,17 @@ namespace {
 const int kTimeoutMs = 3000;      // the longest wait of a case or check
 const int kShortQuietMs = 1000;   // an answer that stopped short is given up after this
 const int kEmptyQuietMs = 300;    // an empty answer: nothing arrives for this long
+
+// Hostile timing for the whole run: on with --hostile[=SEED]; the seed comes
+// from there, from TOLK_HOSTILE_SEED, or from the clock, and a failure names it.
+bool gHostile = false;
+uint64_t gSeed = 0;
+
+// What a link received, noise lines taken out (only hostile timing makes them).
+std::string withoutNoise(const std::string &raw, size_t *held) {
+    *held = 0;
+    return gHostile ? sim::removeNoise(raw, held) : raw;
+}
 
 // Expected bytes; kDigit and kAny are the answers' wildcards \d and \?.
 enum : int { kDigit = 256, kAny = 257 };
@@ -83,6 +99,8 @@ struct Stmt {
     Pattern want;
     bool nocr = false, reconnect = false;
     int timeoutMs = kTimeoutMs;
+    int afterMs = 0;          // a pipe item: wait this long before writing it
+    std::vector<Stmt> items;  // pipe: the writes, in order
 };
 
 struct Group {
@@ -108,6 +126,21 @@ bool splitWords(const std::string &s, std::vector<std::string> *out) {
         if (!decode((*it)[1].matched ? (*it)[1].str() : (*it)[2].str(), 0, &p)) return false;
         out->push_back(bytesOf(p));
     }
+    return true;
+}
+
+// One write of a pipe: "| LINK [(nocr)] [(new)] [(after MS)] BYTES".
+bool parsePipeItem(const std::string &line, Stmt *st) {
+    static const std::regex itemRe("(serial|adb)((?:\\s*\\((?:nocr|new|after \\d+)\\))*)\\s*(.*?)");
+    std::smatch m;
+    Pattern p;
+    if (!std::regex_match(line, m, itemRe) || !decode(m[3], 0, &p)) return false;
+    std::string flags = m[2];
+    st->verb = m[1];
+    st->nocr = flags.find("nocr") != std::string::npos;
+    st->reconnect = flags.find("new") != std::string::npos;
+    if (flags.find("after") != std::string::npos) st->afterMs = atoi(flags.c_str() + flags.find("after") + 6);
+    st->a = bytesOf(p) + (st->nocr ? "" : "\r");
     return true;
 }
 
@@ -165,10 +198,18 @@ bool parse(const std::string &path, Transcript *t, std::string *err) {
         Stmt st;
         st.line = n, st.text = line;
         bool ok = true;
-        if (raw.compare(0, 1, "|") == 0) {
+        if (raw.compare(0, 1, "|") == 0 && !g.stmts.empty() && g.stmts.back().verb == "pipe") {
+            Stmt item;
+            item.line = n, item.text = line;
+            ok = parsePipeItem(sim::trimBlanks(raw.substr(1)), &item);
+            g.stmts.back().items.push_back(item);
+        } else if (raw.compare(0, 1, "|") == 0) {
             ok = !g.stmts.empty() && g.stmts.back().verb == "write";
             if (ok) g.stmts.back().b += raw.substr(raw.compare(0, 2, "| ") == 0 ? 2 : 1) + "\n";
         } else if (line.empty() || line[0] == '#') {
+        } else if (line == "pipe") {
+            st.verb = "pipe";
+            g.stmts.push_back(st);
         } else if (verb == "device") {
             ok = t->groups.empty() && g.stmts.empty() && splitWords(rest, &t->upArgs);
         } else if (verb == "group") {
@@ -197,9 +238,11 @@ std::string takeNow(int fd) {
 struct Device {
     std::unique_ptr<SimDevice> sim;
     std::map<std::string, int> fds;               // "serial", "adb"
+    std::map<std::string, std::string> held;      // per link: a tail that may be the start of a noise line
     std::map<std::string, size_t> journalOffset;  // per journal file: bytes taken
     std::vector<std::string> upArgs;
     std::vector<const Stmt *> early;              // writes before up
+    uint64_t seed = 0;                            // its hostile timing
 
     ~Device() {
         for (auto &f : fds)
@@ -207,6 +250,7 @@ struct Device {
     }
     bool up() {
         if (!sim) {
+            if (gHostile) upArgs.push_back("--hostile=" + std::to_string(seed));
             sim.reset(new SimDevice(upArgs, [this](SimDevice &d) {
                 for (const Stmt *w : early) d.writeFile(w->a, w->b);
             }));
@@ -221,6 +265,14 @@ struct Device {
             fcntl(fd, F_SETFL, fcntl(fd, F_GETFL) | O_NONBLOCK);
         return fd;
     }
+    // What a link holds right now, noise lines taken out.
+    std::string take(const std::string &which) {
+        size_t keep = 0;
+        std::string raw = held[which] + takeNow(fds[which]);
+        std::string out = withoutNoise(raw, &keep);
+        held[which] = raw.substr(raw.size() - keep);
+        return out;
+    }
     // What arrives on the open links within ms; "" when nothing.
     std::string quiet(int ms) {
         std::string out;
@@ -230,9 +282,22 @@ struct Device {
                 if (f.second >= 0) p.push_back({f.second, POLLIN, 0});
             if (poll(p.data(), p.size(), static_cast<int>(left)) <= 0) continue;
             for (auto &f : fds)
-                if (f.second >= 0) out += sim::visibleBytes(takeNow(f.second));
+                if (f.second >= 0) out += sim::visibleBytes(take(f.first));
         }
         return out;
+    }
+    // Writes one send: on adb in hostile mode cut into pieces a few ms apart,
+    // as a TCP forward or a busy host stack delivers it. The serial port is
+    // written whole: its line discipline assembles lines anyway, and its echo
+    // depends on when bytes arrive.
+    bool send(const std::string &which, int fd, const std::string &bytes, const std::string &where) {
+        sim::Hostile h(gHostile && which == "adb", seed, where);
+        std::vector<std::string> pieces = h.split(bytes);
+        for (size_t i = 0; i < pieces.size(); i++) {
+            if (i > 0) sim::sleepMs(h.gapMs());
+            if (!writeAll(fd, pieces[i])) return false;
+        }
+        return true;
     }
 };
 
@@ -245,7 +310,10 @@ public:
         std::unique_ptr<Device> own(g.fresh ? new Device : nullptr);
         if (!g.fresh && !shared_) shared_.reset(new Device);
         Device &dev = g.fresh ? *own : *shared_;
-        if (!dev.sim) dev.upArgs = t_.upArgs, dev.upArgs.insert(dev.upArgs.end(), g.upArgs.begin(), g.upArgs.end());
+        if (!dev.sim) {
+            dev.upArgs = t_.upArgs, dev.upArgs.insert(dev.upArgs.end(), g.upArgs.begin(), g.upArgs.end());
+            dev.seed = gSeed + static_cast<uint64_t>(g.line);
+        }
         std::vector<const Stmt *> todo;
         for (const Group *part : {dev.sim ? nullptr : &t_.setup, &g})
             for (size_t i = 0; part && i < part->stmts.size(); i++) todo.push_back(&part->stmts[i]);
@@ -266,6 +334,9 @@ public:
             if (status != -1) fail(g.line, "tolkd ended during the group with status " + std::to_string(status));
             // A device that goes down now prints its log itself.
             std::string log = dev.sim->log();
+            if (::testing::Test::HasFailure() && gHostile)
+                fprintf(stderr, "hostile timing, seed %llu (TOLK_HOSTILE_SEED=%llu repeats this run)\n",
+                        static_cast<unsigned long long>(gSeed), static_cast<unsigned long long>(gSeed));
             if (::testing::Test::HasFailure() && !g.fresh && sharedLater)
                 fprintf(stderr, "---- end of the tolkd log ----\n%s---- end ----\n",
                         log.substr(log.size() > 6000 ? log.size() - 6000 : 0).c_str());
@@ -283,6 +354,8 @@ private:
         std::string got;
         if (st.verb == "serial" || st.verb == "adb") {
             exchange(dev, st);
+        } else if (st.verb == "pipe") {
+            pipe(dev, st);
         } else if (st.verb.compare(0, 7, "journal") == 0) {
             // A peer writes its line before it answers, but a line written after
             // the answer (feedback to the framework) may still be on its way.
@@ -331,15 +404,35 @@ private:
         }
     }
 
+    // Writes the items of a pipe back to back (or after their own waits),
+    // without reading: the cases after it read each link's answer stream.
+    void pipe(Device &dev, const Stmt &st) {
+        for (const Stmt &item : st.items) {
+            int fd = dev.link(item.verb, item.reconnect);
+            if (fd < 0) return fail(item.line, item.text + "\n  cannot open the link");
+            std::string left = dev.take(item.verb);
+            if (!left.empty()) fail(item.line, item.text + "\n  left over from an earlier case: " + sim::visibleBytes(left));
+            if (item.afterMs > 0) sim::sleepMs(item.afterMs);
+            if (!dev.send(item.verb, fd, item.a, t_.name + ":" + std::to_string(item.line)))
+                return fail(item.line, item.text + "\n  cannot send");
+        }
+    }
+
     void exchange(Device &dev, const Stmt &st) {
         const std::string where = st.text + (st.text.compare(0, 4, "both") == 0 ? "  (on " + st.verb + ")" : "");
         int fd = dev.link(st.verb, st.reconnect);
         if (fd < 0) return fail(st.line, where + "\n  cannot open the link");
+        if (st.reconnect) dev.held[st.verb].clear();
         // Nothing to send: the answer is unsolicited and may be here already.
-        std::string got = takeNow(fd);
-        if (!got.empty() && !st.a.empty())
-            fail(st.line, where + "\n  left over from an earlier case: " + sim::visibleBytes(got)), got.clear();
-        if (!writeAll(fd, st.a)) return fail(st.line, where + "\n  cannot send");
+        std::string raw = dev.held[st.verb] + takeNow(fd);
+        size_t held = 0;
+        std::string got = withoutNoise(raw, &held);
+        if (!got.empty() && !st.a.empty()) {
+            fail(st.line, where + "\n  left over from an earlier case: " + sim::visibleBytes(got));
+            raw = raw.substr(raw.size() - held), got.clear();
+        }
+        if (!dev.send(st.verb, fd, st.a, t_.name + ":" + std::to_string(st.line)))
+            return fail(st.line, where + "\n  cannot send");
         // A wrong answer is read on until the link is quiet, to show all of it; one
         // that stopped short is given up after kShortQuietMs (or the case's timeout).
         long long end = sim::nowMs() + (st.want.empty() ? kEmptyQuietMs : st.timeoutMs);
@@ -356,15 +449,18 @@ private:
                 closed = true;
                 break;
             }
-            if (n > 0) got.append(buf, static_cast<size_t>(n));
+            if (n > 0) raw.append(buf, static_cast<size_t>(n)), got = withoutNoise(raw, &held);
         }
-        if (state == 1) got += takeNow(fd);  // bytes right behind the answer are wrong too
+        if (state == 1) raw += takeNow(fd), got = withoutNoise(raw, &held);  // bytes right behind the answer are wrong too
+        dev.held[st.verb] = raw.substr(raw.size() - held);
+        if (gHostile && got.find(sim::kNoiseText) != std::string::npos)
+            fail(st.line, where + "\n  the noise line arrived torn or framed into an answer: " + sim::visibleBytes(raw));
         bool late = got.size() > st.want.size() && compare(st.want, got.substr(got.size() - st.want.size())) == 1;
         if (compare(st.want, got) != 1)
             fail(st.line, where + "\n  expected: " + show(st.want) + "\n  got:      " + sim::visibleBytes(got) +
                               (closed ? "\n  (the link was closed)" : "") +
                               (late ? "\n  (the bytes before the answer may be left over from the case before)" : ""));
-        if (closed) close(fd), dev.fds[st.verb] = -1;
+        if (closed) close(fd), dev.fds[st.verb] = -1, dev.held[st.verb].clear();
     }
 
     const Transcript &t_;
@@ -383,7 +479,15 @@ struct GroupTest : ::testing::Test {
 int main(int argc, char **argv) {
     ::testing::InitGoogleTest(&argc, argv);
     static Transcript t;
-    std::string err = "usage: e2e_transcripts [gtest options] FILE.tx";
+    std::string err = "usage: e2e_transcripts [gtest options] [--hostile[=SEED]] FILE.tx", seed;
+    if (argc == 3 && std::string(argv[1]).compare(0, 9, "--hostile") == 0) {
+        gHostile = true;
+        seed = argv[1][9] == '=' ? argv[1] + 10 : getenv("TOLK_HOSTILE_SEED") ? getenv("TOLK_HOSTILE_SEED") : "";
+        if (seed.empty()) seed = std::to_string(static_cast<unsigned long long>(sim::nowMs()) ^ getpid());
+        argv[1] = argv[2], argc = 2;
+        if (!sim::parseHostileSeed(seed, &gSeed)) err = "--hostile: the seed is a decimal number, got " + seed, argc = 0;
+        else fprintf(stderr, "hostile timing, seed %s\n", seed.c_str());
+    }
     if (argc != 2 || !parse(argv[1], &t, &err)) {
         fprintf(stderr, "%s\n", err.c_str());
         return 2;
