@@ -18,6 +18,7 @@
 
 #include "cit/pro_info.h"
 #include "core/tolkd_log.h"
+#include "handlers/handlers.h"
 #include "serial/response_writer.h"
 
 int sock_id = -1;
@@ -75,9 +76,14 @@ int cit_start_handler(char *) {
     return 0;
 }
 
+// The power-off is requested first and answered after, as the station has always
+// seen it; a request init refused is an error, not a power-off that never comes.
 int cit_shutdown_handler(char *) {
-    NLOGD("power off: reboot -p");
-    system("reboot -p");
+    NLOGD("power off: %s", POWER_ACTION_SHUTDOWN);
+    if (requestPowerAction(POWER_ACTION_SHUTDOWN) != 0) {
+        answer(kAnswerError, 9);
+        return 0;
+    }
     answer(kAnswerOk, 6);
     return 0;
 }
