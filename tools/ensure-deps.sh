@@ -3,7 +3,7 @@
 # Runs before every configure; does nothing (and needs no network) once they are there.
 # `ensure-deps.sh arm64` adds the aarch64 cross toolchain and qemu-user (make test-arm64).
 set -eu
-pkgs=(cmake g++ make libgtest-dev libgmock-dev libbenchmark-dev python3-serial gammu gsm-utils wvdial)
+pkgs=(cmake g++ make libgtest-dev libgmock-dev libbenchmark-dev python3-serial gammu gsm-utils wvdial checkpolicy m4)
 [ "${1:-}" = arm64 ] && pkgs+=(g++-aarch64-linux-gnu qemu-user)
 need=()
 for pkg in "${pkgs[@]}"; do
