@@ -15,6 +15,7 @@
 #include <tolk_platform/local_socket.h>
 #include <tolk_platform/radio_wire.h>
 
+#include "sim_privilege.h"
 #include "sim_supervisor.h"
 
 namespace sim {
@@ -61,6 +62,11 @@ pid_t Supervisor::spawnPeer(const std::string &name) {
             dup2(out, 2);
         }
         closeFrom(3, -1);
+        std::string err;
+        if (name == "cit" && !becomeTestApp(STDOUT_FILENO, &err)) {
+            fprintf(stderr, "cit peer: %s\n", err.c_str());
+            _exit(126);
+        }
         // A peer that logs through the platform log writes its own file.
         setenv("TOLKD_LOG", logPath.c_str(), 1);
         unsetenv("ANDROID_SOCKET_adb_tolk_socket");
@@ -113,7 +119,7 @@ void Supervisor::waitForPeers() {
         bool all = true;
         for (const auto &p : peers_)
             if (p.second > 0 && !peerReady(p.first)) all = false;
-        if (all) return;
+        if (all) break;
         if (nowMs() >= deadline) break;
         sleepMs(10);
     }
@@ -121,6 +127,7 @@ void Supervisor::waitForPeers() {
         if (p.second > 0 && !peerReady(p.first))
             log("peer %s is not serving after %d ms; starting tolkd anyway", p.first.c_str(),
                 kPeerReadyTimeoutMs);
+    ownDeviceRoot(L_);  // the peers' sockets, as their services create them on the phone
 }
 
 
@@ -142,7 +149,10 @@ std::string Supervisor::startPeer(const std::string &name) {
     for (;;) {
         reapChildren();
         if (peers_[name] <= 0) return "error: peer " + name + " ended at start (see " + L_.peerLog(name) + ")\n";
-        if (peerReady(name)) return "ok\n";
+        if (peerReady(name)) {
+            ownDeviceRoot(L_);
+            return "ok\n";
+        }
         if (nowMs() >= deadline) break;
         sleepMs(5);
     }

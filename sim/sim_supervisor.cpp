@@ -3,6 +3,8 @@
 // of their own (sim_relay.cpp, sim_peers_start.cpp, sim_control.cpp).
 #include "sim_supervisor.h"
 
+#include "sim_privilege.h"
+
 #include <errno.h>
 #include <fcntl.h>
 #include <signal.h>
@@ -180,6 +182,11 @@ pid_t Supervisor::spawnTolkd() {
         memset(&sa, 0, sizeof sa);
         sa.sa_handler = SIG_DFL;
         for (int s : {SIGCHLD, SIGTERM, SIGINT, SIGHUP, SIGPIPE}) sigaction(s, &sa, nullptr);
+        std::string err;
+        if (!becomeServiceUser(&err)) {
+            fprintf(stderr, "cannot start tolkd as its service user: %s\n", err.c_str());
+            _exit(126);
+        }
         const char *bin = opt_.tolkdBinary.c_str();
         char *argv[] = {const_cast<char *>("tolkd"), nullptr};
         execv(bin, argv);
@@ -297,11 +304,13 @@ int Supervisor::run() {
     if (log_) fcntl(fileno(log_), F_SETFD, FD_CLOEXEC);
     log("supervisor %d for %s", getpid(), L_.root.c_str());
     std::string err;
-    if (!setUp(&err)) {
+    if (!setUp(&err) || !prepareDeviceUsers(L_, &err)) {
         log("%s", err.c_str());
         ready("error " + err);
         return 1;
     }
+    log(runsWithPhoneUsers() ? "tolkd and the CIT peer run as the phone's users"
+                             : "not root: tolkd and every peer run as the caller");
     for (const auto &name : peerNames()) spawnPeer(name);
     waitForPeers();
     tolkd_ = spawnTolkd();

@@ -15,6 +15,7 @@
 
 #include <tolk_platform/device_root.h>
 
+#include "sim_privilege.h"
 #include "sim_supervisor.h"
 
 #ifndef TOLKD_DEFAULT_BINARY
@@ -150,6 +151,9 @@ int cmdUp(UpOptions opt) {
                 opt.root.c_str(), opt.root.c_str());
         return 1;
     }
+    if (!runsWithPhoneUsers())
+        fprintf(stderr, "tolk-sim up: not root: tolkd runs as uid %u with the caller's rights, not as the phone's "
+                        "service user\n", (unsigned)getuid());
     std::string err;
     prepareRoot(opt, &err);
     if (!err.empty()) {

@@ -1,12 +1,121 @@
-// What start-up transcripts cannot show: the daemon's own exit in the
-// engineering boot mode, and a simulator that leaves nothing running. The boot
-// modes that serve, ATM mode and the PCT switch are in transcripts/startup.tx.
+// What start-up transcripts cannot show: the daemon's process as init starts it
+// (its user, groups and capabilities, its control socket's owner as adbd and an
+// app meet it), its idle stay in the engineering boot mode, and a simulator that
+// leaves nothing running. The boot modes that serve, ATM mode and the PCT switch
+// are in transcripts/startup.tx.
+#include <errno.h>
+#include <grp.h>
+#include <linux/capability.h>
+#include <poll.h>
 #include <signal.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <sys/wait.h>
+
+#include <cstring>
+#include <filesystem>
+#include <sstream>
 
 #include <gtest/gtest.h>
 
+#include "../../sim/sim_privilege.h"
 #include "../support/eventually.h"
 #include "sim_device.h"
+
+namespace {
+
+// The fields of /proc/PID/status, by name.
+std::string statusField(pid_t pid, const std::string &name) {
+    std::istringstream in(sim::readFileOr("/proc/" + std::to_string(pid) + "/status"));
+    for (std::string line; std::getline(in, line);)
+        if (line.compare(0, name.size() + 1, name + ":") == 0) {
+            std::string v = line.substr(name.size() + 1);
+            v.erase(0, v.find_first_not_of(" \t"));
+            while (!v.empty() && (v.back() == ' ' || v.back() == '\t')) v.pop_back();
+            return v;
+        }
+    return "";
+}
+
+// A client of the adb control socket under uid and groups (the first group is
+// the primary one): the bytes it received for one line, or "errno N" when it
+// could not connect.
+std::string askAs(const std::string &socketPath, uid_t uid, const std::vector<gid_t> &groups,
+                  const std::string &line) {
+    int pfd[2];
+    if (pipe(pfd) != 0) return "pipe";
+    pid_t pid = fork();
+    if (pid == 0) {
+        close(pfd[0]);
+        std::string out;
+        if (setgroups(groups.size(), groups.data()) != 0 || setresgid(groups[0], groups[0], groups[0]) != 0 ||
+            setresuid(uid, uid, uid) != 0) {
+            out = "cannot drop to uid " + std::to_string(uid);
+        } else {
+            int fd = sim::connectUnix(socketPath);
+            if (fd < 0) {
+                out = "errno " + std::to_string(errno);
+            } else {
+                (void)!write(fd, line.data(), line.size());
+                out = readUntil(fd, "OK\r\n", 5000);
+            }
+        }
+        (void)!write(pfd[1], out.data(), out.size());
+        _exit(0);
+    }
+    close(pfd[1]);
+    std::string got;
+    char buf[512];
+    for (ssize_t n; (n = read(pfd[0], buf, sizeof buf)) > 0;) got.append(buf, static_cast<size_t>(n));
+    close(pfd[0]);
+    waitpid(pid, nullptr, 0);
+    return got;
+}
+
+bool alive(pid_t pid) { return pid > 0 && kill(pid, 0) == 0; }
+
+}  // namespace
+
+// As init starts it from device/tolkd.rc: user system, the groups of the
+// sockets and devices it uses (system radio audio wifi; no inet, no
+// net_admin), and SYS_TIME as the only capability in every set. Every other
+// end-to-end test runs the daemon so, which shows it needs no more.
+TEST(Startup, DaemonRunsAsItsServiceUserWithOnlyTheClockCapability) {
+    if (!sim::runsWithPhoneUsers()) GTEST_SKIP() << "not root: the simulator runs tolkd as the caller";
+    SimDevice d;
+    ASSERT_TRUE(d.started()) << d.upOutput();
+    pid_t pid = d.tolkdPid();
+    EXPECT_EQ("1000\t1000\t1000\t1000", statusField(pid, "Uid"));
+    EXPECT_EQ("1000\t1000\t1000\t1000", statusField(pid, "Gid"));
+    EXPECT_EQ("1000 1001 1005 1010", statusField(pid, "Groups"));
+    char sysTime[32];
+    snprintf(sysTime, sizeof sysTime, "%016llx", 1ULL << CAP_SYS_TIME);
+    for (const char *set : {"CapEff", "CapPrm", "CapInh", "CapAmb", "CapBnd"})
+        EXPECT_EQ(sysTime, statusField(pid, set)) << set;
+    EXPECT_EQ("10050\t10050\t10050\t10050",
+              statusField(static_cast<pid_t>(atol(d.readFile("/run/cit.pid").c_str())), "Uid"))
+        << "the CIT application runs under its own app uid";
+    // The clock set, the one privileged call, works; files the daemon makes are its own.
+    EXPECT_EQ("\r\nOK\r\n", d.at("AT+CCLK=\"30/01/02,03:04:05+00\"", true));
+    EXPECT_EQ("\r\nOK\r\n", d.at("AT*CIT_WCITF", true));
+    struct stat st;
+    ASSERT_EQ(0, stat((d.root() + "/data/prod/citf").c_str(), &st));
+    EXPECT_EQ(1000u, st.st_uid);
+}
+
+// adbd runs as uid and gid shell with a few supplementary groups on user
+// builds: `adb forward ... localreserved:adb_tolk_socket` must reach the
+// daemon. An app (its own uid, no group) must not.
+TEST(Startup, AdbdReachesTheControlSocketAndAnAppDoesNot) {
+    if (!sim::runsWithPhoneUsers()) GTEST_SKIP() << "not root: the socket keeps the caller's owner";
+    SimDevice d;
+    ASSERT_TRUE(d.started()) << d.upOutput();
+    const std::string sock = d.env("TOLK_ADB_SOCKET");
+    // shell; adb log input inet net_bt_admin net_bt sdcard_rw readproc
+    const std::vector<gid_t> adbd = {2000, 1011, 1007, 1004, 3003, 3001, 3002, 1015, 3009};
+    EXPECT_EQ("\r\n+CSDF: 1,1\n\r\n\r\nOK\r\n", askAs(sock, 2000, adbd, "AT+CSDF?\r"));
+    EXPECT_EQ("errno " + std::to_string(EACCES), askAs(sock, 10051, {10051}, "AT+CSDF?\r"));
+}
 
 TEST(Startup, EngineeringBootModeStopsTheDaemonWithStatusZero) {
     for (const char *mode : {"5", "57"}) {
@@ -20,8 +129,6 @@ TEST(Startup, EngineeringBootModeStopsTheDaemonWithStatusZero) {
         EXPECT_EQ("", d.getprop("persist.service.pct.mode"));
     }
 }
-
-static bool alive(pid_t pid) { return pid > 0 && kill(pid, 0) == 0; }
 
 // One device per root, and down leaves nothing running.
 TEST(Simulator, DownStopsEverythingAndIsIdempotent) {
