@@ -218,6 +218,12 @@ bool Supervisor::tolkdInMainWait() {
     return false;
 }
 
+// In the engineering boot mode tolkd opens nothing and waits for its end.
+bool Supervisor::tolkdIdle() {
+    std::string s = readFileOr("/proc/" + std::to_string(tolkd_) + "/syscall");
+    return !s.empty() && isdigit(static_cast<unsigned char>(s[0])) && atol(s.c_str()) == SYS_rt_sigsuspend;
+}
+
 void Supervisor::waitForServing() {
     long long deadline = nowMs() + kServeTimeoutMs;
     while (nowMs() < deadline) {
@@ -229,6 +235,11 @@ void Supervisor::waitForServing() {
         if (tolkdInMainWait()) {
             log("tolkd is serving");
             ready("serving " + std::to_string(tolkd_));
+            return;
+        }
+        if (tolkdIdle()) {
+            log("tolkd is idle");
+            ready("idle " + std::to_string(tolkd_));
             return;
         }
         sleepMs(10);

@@ -223,6 +223,11 @@ int cmdUp(UpOptions opt) {
                    opt.root.c_str(), L.envFile().c_str());
         return 0;
     }
+    if (line.compare(0, 5, "idle ") == 0) {
+        fprintf(stderr, "tolkd (pid %s) is idle and serves nothing (engineering boot mode)\n", line.c_str() + 5);
+        lastLog();
+        return 1;
+    }
     if (line.compare(0, 7, "exited ") == 0) {
         std::string s = line.substr(7);
         if (s.compare(0, 7, "signal ") == 0)
