@@ -4,6 +4,7 @@
 // for the host.
 #include "cit/cit_cmd.h"
 
+#include <ctype.h>
 #include <errno.h>
 #include <stdio.h>
 #include <stdlib.h>
@@ -407,7 +408,8 @@ void dropDeadTestAppLink(void) {
 bool configuredTestAppUid(uid_t *uid) {
     char value[PROPERTY_VALUE_MAX] = {0};
     property_get(CIT_APP_UID_PROPERTY, value, "");
-    if (value[0] < '0' || value[0] > '9') return false;
+    // strtoul would take blanks and a sign; a uid is digits only.
+    if (!isdigit((unsigned char)value[0])) return false;
     char *end = nullptr;
     errno = 0;
     unsigned long n = strtoul(value, &end, 10);
