@@ -15,6 +15,7 @@
 #include <tolk_platform/local_socket.h>
 #include <tolk_platform/radio_wire.h>
 
+#include "sim_privilege.h"
 #include "sim_supervisor.h"
 
 namespace sim {
@@ -61,6 +62,11 @@ pid_t Supervisor::spawnPeer(const std::string &name) {
             dup2(out, 2);
         }
         closeFrom(3, -1);
+        std::string err;
+        if (name == "cit" && !becomeTestApp(STDOUT_FILENO, &err)) {
+            fprintf(stderr, "cit peer: %s\n", err.c_str());
+            _exit(126);
+        }
         // A peer that logs through the platform log writes its own file.
         setenv("TOLKD_LOG", logPath.c_str(), 1);
         unsetenv("ANDROID_SOCKET_adb_tolk_socket");
@@ -121,7 +127,10 @@ bool Supervisor::waitForPeers(std::string *err) {
         bool all = true;
         for (const auto &p : peers_)
             if (!peerReady(p.first)) all = false;
-        if (all) return true;
+        if (all) {
+            ownDeviceRoot(L_);  // the peers' sockets, as their services create them on the phone
+            return true;
+        }
         if (nowMs() >= deadline) break;
         sleepMs(10);
     }
@@ -154,7 +163,10 @@ std::string Supervisor::startPeer(const std::string &name) {
     for (;;) {
         reapChildren();
         if (peers_[name] <= 0) return "error: peer " + name + " ended at start (see " + L_.peerLog(name) + ")\n";
-        if (peerReady(name)) return "ok\n";
+        if (peerReady(name)) {
+            ownDeviceRoot(L_);
+            return "ok\n";
+        }
         if (nowMs() >= deadline) break;
         sleepMs(5);
     }

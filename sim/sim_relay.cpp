@@ -14,6 +14,7 @@
 #include <cstring>
 
 #include "acm_lines.h"
+#include "sim_privilege.h"
 #include "sim_supervisor.h"
 
 namespace sim {
@@ -67,6 +68,7 @@ bool Supervisor::setUpLink(std::string *err) {
     // defaults (ICRNL: a CR typed by the host ends a canonical line); the
     // daemon applies its own when it opens the port.
     if (!openPty(&dev_, err)) return false;
+    ownSerialPort(dev_.slave);
     if (!replaceSymlink(dev_.slaveName, L_.deviceTty())) {
         *err = "cannot link " + L_.deviceTty() + ": " + strerror(errno);
         return false;
@@ -102,6 +104,7 @@ std::string Supervisor::replug() {
     PtyPair fresh;
     std::string err;
     if (!openPty(&fresh, &err)) return "error: " + err + "\n";
+    ownSerialPort(fresh.slave);  // before tolkd can find it
     if (!replaceSymlink(fresh.slaveName, L_.deviceTty())) {
         close(fresh.master);
         close(fresh.slave);

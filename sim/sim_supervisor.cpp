@@ -3,6 +3,8 @@
 // of their own (sim_relay.cpp, sim_peers_start.cpp, sim_control.cpp).
 #include "sim_supervisor.h"
 
+#include "sim_privilege.h"
+
 #include <errno.h>
 #include <fcntl.h>
 #include <signal.h>
@@ -180,6 +182,11 @@ pid_t Supervisor::spawnTolkd() {
         memset(&sa, 0, sizeof sa);
         sa.sa_handler = SIG_DFL;
         for (int s : {SIGCHLD, SIGTERM, SIGINT, SIGHUP, SIGPIPE}) sigaction(s, &sa, nullptr);
+        std::string err;
+        if (!becomeServiceUser(&err)) {
+            fprintf(stderr, "cannot start tolkd as its service user: %s\n", err.c_str());
+            _exit(126);
+        }
         const char *bin = opt_.tolkdBinary.c_str();
         char *argv[] = {const_cast<char *>("tolkd"), nullptr};
         execv(bin, argv);
@@ -211,6 +218,12 @@ bool Supervisor::tolkdInMainWait() {
     return false;
 }
 
+// In the engineering boot mode tolkd opens nothing and waits for its end.
+bool Supervisor::tolkdIdle() {
+    std::string s = readFileOr("/proc/" + std::to_string(tolkd_) + "/syscall");
+    return !s.empty() && isdigit(static_cast<unsigned char>(s[0])) && atol(s.c_str()) == SYS_rt_sigsuspend;
+}
+
 void Supervisor::waitForServing() {
     long long deadline = nowMs() + kServeTimeoutMs;
     while (nowMs() < deadline) {
@@ -222,6 +235,11 @@ void Supervisor::waitForServing() {
         if (tolkdInMainWait()) {
             log("tolkd is serving");
             ready("serving " + std::to_string(tolkd_));
+            return;
+        }
+        if (tolkdIdle()) {
+            log("tolkd is idle");
+            ready("idle " + std::to_string(tolkd_));
             return;
         }
         sleepMs(10);
@@ -304,7 +322,7 @@ int Supervisor::run() {
     if (log_) fcntl(fileno(log_), F_SETFD, FD_CLOEXEC);
     log("supervisor %d for %s", getpid(), L_.root.c_str());
     std::string err;
-    if (!setUp(&err)) {
+    if (!setUp(&err) || !prepareDeviceUsers(L_, &err)) {
         log("%s", err.c_str());
         shutdownAll();
         ready("error " + err);
@@ -323,6 +341,8 @@ int Supervisor::run() {
         ready("error " + err);
         return 1;
     }
+    log(runsWithPhoneUsers() ? "tolkd and the CIT peer run as the phone's users"
+                             : "not root: tolkd and every peer run as the caller");
     tolkd_ = spawnTolkd();
     if (tolkd_ < 0) {
         shutdownAll();

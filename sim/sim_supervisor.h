@@ -59,6 +59,7 @@ private:
     pid_t spawnTolkd();
     void waitForServing();
     bool tolkdInMainWait();
+    bool tolkdIdle();
     void reapChildren();
     void childEnded(pid_t pid, int status);
     bool terminate(pid_t pid, const std::string &what);

@@ -19,6 +19,7 @@
 #include <tolk_platform/device_root.h>
 
 #include "hostile.h"
+#include "sim_privilege.h"
 #include "sim_supervisor.h"
 
 #ifndef TOLKD_DEFAULT_BINARY
@@ -267,6 +268,9 @@ int cmdUp(UpOptions opt, bool *started) {
         return kExitFailed;
     }
     removeDeviceLinks(L);
+    if (!runsWithPhoneUsers())
+        fprintf(stderr, "tolk-sim up: not root: tolkd runs as uid %u with the caller's rights, not as the phone's "
+                        "service user\n", (unsigned)getuid());
     std::string err;
     prepareRoot(opt, &err);
     // The peers read the seed when they start (and again at `start NAME`); no
@@ -355,6 +359,11 @@ int cmdUp(UpOptions opt, bool *started) {
                    opt.root.c_str(), L.envFile().c_str(),
                    opt.hostile ? ("; hostile timing, seed " + opt.hostileSeed).c_str() : "");
         return kExitOk;
+    }
+    if (line.compare(0, 5, "idle ") == 0) {
+        fprintf(stderr, "tolkd (pid %s) is idle and serves nothing (engineering boot mode)\n", line.c_str() + 5);
+        lastLog();
+        return 1;
     }
     if (line.compare(0, 7, "exited ") == 0) {
         if (started) *started = true;

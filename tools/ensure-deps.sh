@@ -7,6 +7,8 @@ pkgs=(cmake g++ make libgtest-dev libgmock-dev libbenchmark-dev python3-serial g
 # The real libcutils, liblog and libutils headers: the check build.android_headers
 # compiles the daemon against them, so that a stand-in that drifted is caught.
 pkgs+=(android-libcutils-dev android-liblog-dev android-libutils-dev)
+# checkpolicy (and the m4 its macros go through) compiles the device's SELinux policy.
+pkgs+=(checkpolicy m4)
 [ "${1:-}" = arm64 ] && pkgs+=(g++-aarch64-linux-gnu qemu-user)
 need=()
 for pkg in "${pkgs[@]}"; do

@@ -4,6 +4,7 @@
 // for the host.
 #include "cit/cit_cmd.h"
 
+#include <ctype.h>
 #include <errno.h>
 #include <stdio.h>
 #include <stdlib.h>
@@ -18,6 +19,7 @@
 
 #include "cit/pro_info.h"
 #include "core/tolkd_log.h"
+#include "handlers/handlers.h"
 #include "serial/response_writer.h"
 
 int sock_id = -1;
@@ -75,9 +77,14 @@ int cit_start_handler(char *) {
     return 0;
 }
 
+// The power-off is requested first and answered after, as the station has always
+// seen it; a request init refused is an error, not a power-off that never comes.
 int cit_shutdown_handler(char *) {
-    NLOGD("power off: reboot -p");
-    system("reboot -p");
+    NLOGD("power off: %s", POWER_ACTION_SHUTDOWN);
+    if (requestPowerAction(POWER_ACTION_SHUTDOWN) != 0) {
+        answer(kAnswerError, 9);
+        return 0;
+    }
     answer(kAnswerOk, 6);
     return 0;
 }
@@ -396,12 +403,58 @@ void dropDeadTestAppLink(void) {
     sock_id = -1;
 }
 
+// The uid the device build gives the test application; false when the property
+// holds no uid, in which case no peer is trusted.
+bool configuredTestAppUid(uid_t *uid) {
+    char value[PROPERTY_VALUE_MAX] = {0};
+    property_get(CIT_APP_UID_PROPERTY, value, "");
+    // strtoul would take blanks and a sign; a uid is digits only.
+    if (!isdigit((unsigned char)value[0])) return false;
+    char *end = nullptr;
+    errno = 0;
+    unsigned long n = strtoul(value, &end, 10);
+    // (uid_t)-1 means "no uid" to the kernel; it can be nobody's.
+    if (errno != 0 || *end != '\0' || n >= (unsigned long)(uid_t)-1) return false;
+    *uid = (uid_t)n;
+    return true;
+}
+
+// An abstract socket name belongs to whichever process binds it first, so any
+// installed app could pose as the test application and pass every test. Only a
+// peer running under the configured uid is taken for the application.
+bool peerIsTestApp(int fd) {
+    uid_t expected = 0;
+    if (!configuredTestAppUid(&expected)) {
+        NLOGE("%s holds no uid: no test application is trusted", CIT_APP_UID_PROPERTY);
+        return false;
+    }
+    struct ucred cred;
+    socklen_t len = sizeof(cred);
+    if (getsockopt(fd, SOL_SOCKET, SO_PEERCRED, &cred, &len) != 0 || len != sizeof(cred)) {
+        NLOGE("credentials of %s unknown errno %d", CIT_SOCKET_NAME, errno);
+        return false;
+    }
+    if (cred.uid != expected) {
+        NLOGE("%s is served by uid %u pid %d, not the test application (uid %u)", CIT_SOCKET_NAME,
+              (unsigned)cred.uid, (int)cred.pid, (unsigned)expected);
+        return false;
+    }
+    return true;
+}
+
 int forwardToTestApp(char *line) {
     dropDeadTestAppLink();
     if (sock_id < 0) {
         sock_id = socket_local_client(CIT_SOCKET_NAME, ANDROID_SOCKET_NAMESPACE_ABSTRACT, SOCK_STREAM);
         if (sock_id < 0) {
             NLOGE("connect to %s fails errno %d", CIT_SOCKET_NAME, errno);
+            sock_id = -1;
+            answer("test_fail\r\nERROR\r\n", 19);
+            return -1;
+        }
+        // An impostor hears nothing and is answered for as a missing application.
+        if (!peerIsTestApp(sock_id)) {
+            close(sock_id);
             sock_id = -1;
             answer("test_fail\r\nERROR\r\n", 19);
             return -1;

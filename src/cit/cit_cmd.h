@@ -4,6 +4,8 @@
 #define TOLKD_CIT_CIT_CMD_H
 
 #define CIT_SOCKET_NAME "auto_cit"
+// The uid the test application runs under, set by the device build.
+#define CIT_APP_UID_PROPERTY "ro.vendor.tolk.cit_uid"
 #define CIT_RESULT_FILE "/data/prod/citf"
 #define CIT_ANSWER_SIZE 1024
 

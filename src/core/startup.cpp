@@ -5,6 +5,7 @@
 
 #include <errno.h>
 #include <fcntl.h>
+#include <signal.h>
 #include <stdio.h>
 #include <stdlib.h>
 #include <string.h>
@@ -36,6 +37,17 @@ int getBootMode(void) {
     return atoi(buf);
 }
 
+// The daemon must not serve in the engineering boot mode, but a service that exits
+// is started again by init a few seconds later, for as long as the device runs.
+// Staying alive without opening anything ends that loop, while a crash in any
+// other mode is still restarted. init's signal at shutdown ends the wait.
+static void idleUntilStopped(void) {
+    LOGI("idle until the device shuts down");
+    sigset_t none;
+    sigemptyset(&none);
+    for (;;) sigsuspend(&none);
+}
+
 int adb_socket_listen(int fd) {
     LOGD("Listen socket on fd :%d", fd);
     if (listen(fd, 2) < 0) {
@@ -50,7 +62,7 @@ int tolkdMain(void) {
     LOGI("Boot mode = %d", bootMode);
     if (bootMode == BOOT_MODE_ADVANCED_VEMO) {
         LOGI("advanced vemo mode, stop tolkd-daemon");
-        exit(0);
+        idleUntilStopped();
     }
     LOGI("tolkd-daemon start!!!");
 

@@ -7,8 +7,8 @@
 // The engineering boot mode, in which the daemon must not run.
 #define BOOT_MODE_ADVANCED_VEMO 5
 
-// Runs the daemon: exits with 0 in the engineering boot mode, returns 1 when a host
-// link cannot be set up, and otherwise never returns.
+// Runs the daemon: idles in the engineering boot mode, returns 1 when a host link
+// cannot be set up, and otherwise never returns.
 int tolkdMain(void);
 
 #endif

@@ -15,6 +15,13 @@ int pas_tolk_handler(const char *param, int opType, char *response);
 int pas_vzwtolkcfg_handler(const char *param, int opType, char *response);
 int pas_cmec_handler(const char *param, int opType, char *response);
 
+// Reboot and power-off are requests to init through this property ("reboot,REASON",
+// "shutdown,REASON"); 0 once init took the request, -1 when it was refused.
+#define POWERCTL_PROPERTY "sys.powerctl"
+#define POWER_ACTION_REBOOT "reboot,tolkd"
+#define POWER_ACTION_SHUTDOWN "shutdown,tolkd"
+int requestPowerAction(const char *action);
+
 // Clock commands.
 extern int gCsdfMode;
 extern int gCsdfAuxmode;

@@ -24,6 +24,7 @@
 #include <gtest/gtest.h>
 
 #include "../../support/eventually.h"
+#include "sim_privilege.h"
 #include "sim_text.h"
 #include "sim_util.h"
 
@@ -162,6 +163,9 @@ void SimDevice::writeFile(const std::string &devicePath, const std::string &cont
     std::string path = root_ + devicePath;
     sim::makeDirs(path.substr(0, path.rfind('/')));
     EXPECT_TRUE(sim::writeFile(path, content)) << "cannot write " << path;
+    // Written as root: the file gets the owner it has on the phone, so that the
+    // daemon can use it as far as the phone lets it, and no further.
+    sim::ownDevicePath(sim::RootLayout{root_}, devicePath);
 }
 
 bool SimDevice::fileExists(const std::string &devicePath) const { return sim::fileExists(root_ + devicePath); }

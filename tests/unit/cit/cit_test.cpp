@@ -4,6 +4,7 @@
 #include <signal.h>
 #include <sys/wait.h>
 
+#include <fstream>
 #include <memory>
 
 #include <cutils/sockets.h>
@@ -16,10 +17,12 @@
 namespace {
 
 const char kStore[] = "/nvram/PRODUCT_INFO";
+const std::string kAppUidProperty = std::string("/properties/") + CIT_APP_UID_PROPERTY;
 
 // The test application in a child process, on the abstract socket the daemon
-// connects to: one word (and its NUL) per read, answered with the file /app/WORD
-// of the device root ("OK" without one). Ending it ends its links, as a restart does.
+// connects to: one word (and its NUL) per read, noted in /app/heard and answered
+// with the file /app/WORD of the device root ("OK" without one). Ending it ends
+// its links, as a restart does.
 class TestApp {
 public:
     explicit TestApp(const TestRoot &root) {
@@ -30,6 +33,7 @@ public:
             char buf[256] = {};
             for (int conn; (conn = accept(listenFd, nullptr, nullptr)) >= 0; close(conn)) {
                 for (ssize_t n; (n = read(conn, buf, sizeof(buf) - 1)) > 0; memset(buf, 0, sizeof(buf))) {
+                    std::ofstream(root.at("/app/heard"), std::ios::app) << buf << "\n";
                     const std::string word = std::string("/app/") + buf;
                     const std::string text = root.exists(word) ? root.read(word) : "OK";
                     (void)!send(conn, text.data(), text.size(), MSG_NOSIGNAL);
@@ -50,6 +54,11 @@ private:
 
 class CitTest : public LinkTest {
 protected:
+    // The device build names the test application's uid; here it is ours.
+    void SetUp() override {
+        LinkTest::SetUp();
+        root.write(kAppUidProperty, std::to_string(getuid()));
+    }
     void TearDown() override {
         closeFd(sock_id);
         LinkTest::TearDown();
@@ -166,4 +175,25 @@ TEST(ProInfo, IndexesOutsideTheRecordAreRefused) {
         setFlag(index, 0x22);
     }
     EXPECT_EQ(r, root.read(kStore));
+}
+
+// Any process may bind the abstract name first. Only a peer under the uid the
+// device build names is the application; anything else is answered for as a
+// missing application and hears no word. 2^32 must not wrap onto uid 0.
+TEST_F(CitForward, OnlyThePeerUnderTheConfiguredUidIsTheApplication) {
+    TestApp app(root);
+    root.write("/app/heard", "");
+    const std::string me = std::to_string(getuid());
+    for (const std::string &value : {std::string("(unset)"), std::string(""), std::to_string(getuid() + 1),
+                                     std::string("app"), " " + me, me + "x", std::string("4294967295"),
+                                     std::string("4294967296"), std::string("-4294967296")}) {
+        if (value == "(unset)") std::remove(root.at(kAppUidProperty).c_str());
+        else root.write(kAppUidProperty, value);
+        EXPECT_EQ("\r\ntest_fail\r\nERROR\r\n\r\n", ask("AT*CIT_SN", -1)) << "uid property " << value;
+        EXPECT_EQ(-1, sock_id);
+    }
+    EXPECT_EQ("", root.read("/app/heard"));
+    root.write(kAppUidProperty, me);
+    EXPECT_EQ(framedVerdict("OK", true), ask("AT*CIT_SN"));
+    EXPECT_EQ("sn\n", root.read("/app/heard"));
 }
