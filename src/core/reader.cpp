@@ -280,9 +280,11 @@ static char *acceptLine(SerialDevice *dev, int slot, int n) {
     return dev->cmdBuf;
 }
 
-// How long select may sleep: until an incomplete generic answer must go out.
+// How long select may sleep: until an answer without its final result must be
+// taken as complete.
 static struct timeval *selectTimeout(struct timeval *tv) {
-    const int ms = genericLinkQuietMs();
+    const int generic = genericLinkQuietMs(), modem = modemLinkQuietMs();
+    const int ms = generic < 0 ? modem : modem < 0 ? generic : (generic < modem ? generic : modem);
     if (ms < 0) return NULL;
     tv->tv_sec = ms / 1000;
     tv->tv_usec = (ms % 1000) * 1000;
@@ -339,6 +341,7 @@ char *readline(SerialDevice *dev) {
         const int ready = select(maxFd + 1, &readSet, NULL, NULL, selectTimeout(&tv));
         if (ready == 0) {
             genericLinkQuiet();
+            msgTextPhaseEndedBy(modemLinkQuiet());
             continue;
         }
         if (ready < 0) {

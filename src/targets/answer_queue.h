@@ -8,6 +8,10 @@
 
 #include "serial/serial_device.h"
 
+// How long the pieces of one answer may lie apart. An answer without a final
+// result line still reaches the host once its link has been quiet this long.
+#define ANSWER_PIECE_WAIT_MS 50
+
 // More commands outstanding on one link than any station pipelines; when it is
 // exceeded the oldest is forgotten (its answer then goes to the current link).
 #define ANSWER_QUEUE_SIZE 64

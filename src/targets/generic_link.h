@@ -8,10 +8,7 @@
 #include <stdbool.h>
 
 #include "serial/serial_device.h"
-
-// How long the pieces of one answer may lie apart. An answer without a final
-// result line still reaches the host once its link has been quiet this long.
-#define ANSWER_PIECE_WAIT_MS 50
+#include "targets/answer_queue.h"
 
 // A command from origin went out on the link; the next answer due is its.
 void genericCommandSent(const HostLink *origin);

@@ -24,6 +24,12 @@ int sendDataToRild(const char *line);
 // Returns the text phase that ended (the final result of one of its lines came,
 // or its answers were lost with their service), TEXT_PHASE_ANY, or 0.
 unsigned serveModemLink(void);
+// Milliseconds until an answer without its final result is taken as complete;
+// -1 when none waits.
+int modemLinkQuietMs(void);
+// Completes the answers whose slot has been quiet for the piece wait; returns the
+// text phase one of them ended (0: none).
+unsigned modemLinkQuiet(void);
 // Forgets a record half read from a pair that has been replaced.
 void modemLinkReset(void);
 

@@ -16,6 +16,7 @@
 #include "dispatch/command_type.h"
 #include "serial/response_writer.h"
 #include "serial/serial_device.h"
+#include "targets/answer_queue.h"
 #include "targets/generic_link.h"
 #include "targets/modem_link.h"
 #include "targets/target_conn.h"

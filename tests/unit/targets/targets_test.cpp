@@ -11,6 +11,7 @@
 #include <tolk_platform/local_socket.h>
 
 #include "dispatch/dispatcher.h"
+#include "eventually.h"
 #include "hal/tolkd_adaptation.h"
 #include "host_capture.h"
 #include "targets/generic_link.h"
@@ -54,8 +55,11 @@ TEST_F(TargetLinks, ModemRecordsAreRelayedWholeHoweverThePairCutsThem) {
     listing += "\r\nOK\r\n";
     const std::string stream = record(MODEM_RECORD_ANSWER, std::string("\r\n+CSQ: 20,99\r\n\r\nOK\r\n\0", 23)) +
                                record(MODEM_RECORD_INDICATION, std::string("\r\nRING\r\n\0", 9)) +
-                               record(MODEM_RECORD_ANSWER, listing) + record(MODEM_RECORD_ANSWER, "OK");
-    const std::string expected = "\r\n+CSQ: 20,99\r\n\r\nOK\r\n\r\nRING\r\n" + listing + "\r\nOK\r\n";
+                               record(MODEM_RECORD_ANSWER, listing) + record(MODEM_RECORD_ANSWER, "OK") +
+                               // An answer the modem handed over in two callbacks is one.
+                               record(MODEM_RECORD_ANSWER, "\r\n+CGATT: 1\r") + record(MODEM_RECORD_ANSWER, "\n\r\nOK\r\n");
+    const std::string expected =
+        "\r\n+CSQ: 20,99\r\n\r\nOK\r\n\r\nRING\r\n" + listing + "\r\nOK\r\n\r\n+CGATT: 1\r\n\r\nOK\r\n";
     for (size_t cut : {stream.size(), size_t(1), size_t(5), size_t(6143), size_t(6145)}) {
         int bridge = link(&s_fdRild_command);
         modemLinkReset();
@@ -67,6 +71,14 @@ TEST_F(TargetLinks, ModemRecordsAreRelayedWholeHoweverThePairCutsThem) {
         EXPECT_EQ(expected, host.drain()) << "pieces of " << cut;
         closeFd(s_fdRild_command);
     }
+    // An answer without a final result line is whole once its slot has been quiet.
+    writeAll(link(&s_fdRild_command), record(MODEM_RECORD_ANSWER, "\r\n+FOO: 1\r\n"));
+    serveModemLink();
+    EXPECT_EQ("\r\n+FOO: 1", host.take()) << "its tail waits to be known as its end";
+    ASSERT_TRUE(eventually([] { return modemLinkQuietMs() == 0; }));
+    modemLinkQuiet();
+    EXPECT_EQ("\r\n", host.drain());
+    EXPECT_EQ(-1, modemLinkQuietMs());
 }
 
 // The text phase ends with the last line of an answer that is a final result,
@@ -307,20 +319,22 @@ protected:
 };
 
 TEST_F(MmiQueue, SurplusModemOutputDoesNotStrandLaterCommands) {
-    // Unsolicited output answers nothing. An answer the modem sent in two pieces
-    // pushes the count below zero; a command queued afterwards must still get its
-    // own answer.
+    // Unsolicited output answers nothing, and an answer the modem hands over in
+    // two pieces is one answer. A surplus answer pushes the count below zero; a
+    // command queued afterwards must still get its own answer.
     ordinaryCommand();
     modemAnswer("\r\n+CREG: 1\r\n", MODEM_RECORD_INDICATION);
     EXPECT_EQ(1, gMmiCmdSeq.idx);
     modemAnswer("\r\n+CSQ: 20,99\r\n");
+    modemAnswer("\r\nOK\r\n");
+    EXPECT_EQ(0, gMmiCmdSeq.idx);
     modemAnswer("\r\nOK\r\n");
     EXPECT_EQ(-1, gMmiCmdSeq.idx);
     EXPECT_EQ(-1, s_fdService_command) << "nothing went to the MMI client";
 
     mmiCommand("AT+CUSD=+ORVTOLKJ");
     EXPECT_GE(gMmiCmdSeq.seq[0], 1);
-    modemAnswer(std::string("USSD\0tail", 9));  // the text ends at its first NUL
+    modemAnswer(std::string("USSD\0tail", 9));  // the text ends at its first NUL, and the answer with it
     EXPECT_EQ("AT+CUSD=+ORVTOLKJUSSD;", mmiClient());
     EXPECT_EQ(-1, gMmiCmdSeq.seq[0]);
 
@@ -332,8 +346,8 @@ TEST_F(MmiQueue, SurplusModemOutputDoesNotStrandLaterCommands) {
     mmiCommand("AT+CLIP?+ORVTOLKJ");
     modemAnswer("OK");
     EXPECT_EQ("", mmiClient());
-    modemAnswer("+CLIP: 1,1");
-    EXPECT_EQ("AT+CLIP?+ORVTOLKJ+CLIP: 1,1;", mmiClient());
+    modemAnswer("+CLIP: 1,1\r\nOK");
+    EXPECT_EQ("AT+CLIP?+ORVTOLKJ+CLIP: 1,1\r\nOK;", mmiClient());
 }
 
 TEST_F(MmiQueue, FullQueueStoresNothingAndKeepsTextsInStep) {
@@ -350,14 +364,14 @@ TEST_F(MmiQueue, FullQueueStoresNothingAndKeepsTextsInStep) {
 
     std::string expected;
     for (int i = 0; i < MMI_QUEUE_SIZE; i++) {
-        modemAnswer("R" + std::to_string(i));
-        expected += "CMD" + std::to_string(i) + "R" + std::to_string(i) + ";";
+        modemAnswer("R" + std::to_string(i) + "\r\nOK");
+        expected += "CMD" + std::to_string(i) + "R" + std::to_string(i) + "\r\nOK;";
     }
-    modemAnswer("R10");  // the unqueued command's answer goes to the host only
+    modemAnswer("R10\r\nOK");  // the unqueued command's answer goes to the host only
     EXPECT_EQ(expected, mmiClient());
 
     // The indexes wrapped around; the queue works on.
     mmiCommand("AGAIN");
-    modemAnswer("X");
-    EXPECT_EQ("AGAINX;", mmiClient());
+    modemAnswer("ERROR");
+    EXPECT_EQ("AGAINERROR;", mmiClient());
 }
