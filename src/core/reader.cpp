@@ -89,8 +89,8 @@ int adb_socket_accept(int listenFd) {
     return fd;
 }
 
-// Reads at most want bytes from a host slot into buf (DATA_BUF_SIZE bytes, zeroed
-// by the caller).
+// Reads at most want bytes from a host slot into buf (DATA_BUF_SIZE bytes) and
+// terminates them.
 // Returns the byte count, or -1 when the adb connection is gone. A dead serial port
 // is reopened in place; if that is impossible the daemon has no reason to live.
 static int readFromHost(SerialDevice *dev, int slot, char *buf, int want) {
@@ -98,7 +98,10 @@ static int readFromHost(SerialDevice *dev, int slot, char *buf, int want) {
         int fd = dev->fd[slot];
         LOGD("Wait for read data from USB :%d", fd);
         ssize_t n = read(fd, buf, (size_t)want);
-        if (n > 0) return (int)n;
+        if (n > 0) {
+            buf[n] = '\0';  // want is at most MAX_DATA_LEN
+            return (int)n;
+        }
         if (n < 0 && (errno == EINTR || errno == EAGAIN)) continue;
 
         LOGE("FATAL Error in serail read:%d", errno);
@@ -117,7 +120,6 @@ static int readFromHost(SerialDevice *dev, int slot, char *buf, int want) {
             exit(1);
         }
         LOGD("The FD is FATAL Error reopen successfully");
-        memset(buf, 0, DATA_BUF_SIZE);
     }
 }
 
@@ -293,17 +295,17 @@ static struct timeval *selectTimeout(struct timeval *tv) {
 
 char *readline(SerialDevice *dev) {
     LOGD("Enter");
-    memset(lineBuf, 0, sizeof(lineBuf));
-    memset(adbBuf, 0, sizeof(adbBuf));
     tolk_conn_mode = CONN_MODE_VCOM;
 
+    // Every line is terminated where it ends, so the buffers are emptied, not
+    // cleared: clearing 6 KB three times was a fifth of what a command cost.
     for (;;) {
         // While SMS text is merged, cmdBuf holds the message collected so far.
         if (!isNeedMergeMsgCmdInput) {
-            memset(dev->cmdBuf, 0, sizeof(dev->cmdBuf));
+            dev->cmdBuf[0] = '\0';
             dev->cmdLen = 0;
         }
-        memset(lineBuf, 0, sizeof(lineBuf));
+        lineBuf[0] = '\0';
         dev->state = 0;
 
         // Lines that came in the reads before are served before the next wait.
@@ -393,7 +395,6 @@ char *readline(SerialDevice *dev) {
             // No more than the adb bytes still waiting leave room for.
             want = MAX_DATA_LEN - adbLineLen;
         }
-        memset(buf, 0, DATA_BUF_SIZE);
 
         int n = readFromHost(dev, slot, buf, want);
         if (n < 0) return NULL;
@@ -403,7 +404,10 @@ char *readline(SerialDevice *dev) {
             usleep(10 * 1000);
         }
         // A frame begins a line; on adb only a read that starts one can hold it.
-        if (slot == DEVICE_SERIAL || adbLineLen == 0) n = repairMmitestFrame(dev->fd[slot], buf, n);
+        if (slot == DEVICE_SERIAL || adbLineLen == 0) {
+            n = repairMmitestFrame(dev->fd[slot], buf, n);
+            buf[n] = '\0';
+        }
 
         LOGD("tolk_conn_mode = [%d], [%x]", tolk_conn_mode, (unsigned char)buf[0]);
 

@@ -197,8 +197,13 @@ int writeDataToLink(const HostLink *to, const char *data, int len) {
         text = converted;
     }
     char framed[WRITER_MAX_LEN + 8];
-    const int outLen = snprintf(framed, sizeof(framed), "\r\n%s\r\n", text);
-    return writeToHost(fd, framed, outLen);
+    const size_t textLen = strlen(text);  // at most bodyLen
+    framed[0] = '\r';
+    framed[1] = '\n';
+    memcpy(framed + 2, text, textLen);
+    framed[textLen + 2] = '\r';
+    framed[textLen + 3] = '\n';
+    return writeToHost(fd, framed, (int)textLen + 4);
 }
 
 int writeDataToSerial(const char *data, int len) { return writeDataToLink(NULL, data, len); }
@@ -312,8 +317,7 @@ int writeDataToserialByResponseType(int type) {
         text = "UNKNOWN";
         break;
     }
-    char buf[2048];
-    memset(buf, 0, sizeof(buf));
+    char buf[32];
     const int n = snprintf(buf, sizeof(buf), "\r\n%s\r\n", text);
     return writeDataToSerial(buf, n);
 }

@@ -131,17 +131,37 @@ char prio_char(int prio) {
     }
 }
 
-// Where lines go now; "" means stderr.
+// Where the lines go, set by the process's starter (tolk-sim for the daemon) and
+// read once, like the filter: two getenv() calls per written line were a quarter
+// of what a command cost.
+struct Destination {
+    const char *file;  // TOLKD_LOG, or NULL: the device root decides
+    bool alsoStderr;   // TOLKD_LOG_STDERR=1
+};
+
+const Destination &configured() {
+    static const Destination d = [] {
+        const char *file = getenv("TOLKD_LOG");
+        const char *toStderr = getenv("TOLKD_LOG_STDERR");
+        Destination r;
+        r.file = file != nullptr && file[0] != '\0' ? strdup(file) : nullptr;  // kept for the process
+        r.alsoStderr = toStderr != nullptr && strcmp(toStderr, "1") == 0;
+        return r;
+    }();
+    return d;
+}
+
+// Where lines go now; "" means stderr. Without TOLKD_LOG they follow the device
+// root, which tests move between cases.
 std::string destination() {
-    const char *file = getenv("TOLKD_LOG");
-    if (file != nullptr && file[0] != '\0') return file;
+    const Destination &d = configured();
+    if (d.file != nullptr) return d.file;
     const char *root = tolk_device_root();
     if (root != nullptr) return std::string(root) + "/log/tolkd.log";
     return "";
 }
 
-// The descriptor for dest, reopened when the destination changed (tests move the
-// root between cases); -1 means stderr.
+// The descriptor for dest, reopened when the destination changed; -1 means stderr.
 int dest_fd(LogState &s, const std::string &dest) {
     if (s.fd >= 0 && dest == s.destPath) return s.fd;
     if (s.fd >= 0) close(s.fd);
@@ -153,6 +173,14 @@ int dest_fd(LogState &s, const std::string &dest) {
     s.fd = openat(AT_FDCWD, dest.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
     if (s.fd < 0) s.destPath.clear();
     return s.fd;
+}
+
+// The descriptor lines go to now (-1: stderr). With TOLKD_LOG set the file is
+// opened once and no path is built per line.
+int current_fd(LogState &s) {
+    const Destination &d = configured();
+    if (d.file != nullptr && s.fd >= 0 && s.destPath.size() != 0) return s.fd;
+    return dest_fd(s, destination());
 }
 
 // The ids in every line's header. Each getpid()/gettid() is a system call on the
@@ -296,12 +324,10 @@ extern "C" int __android_log_print(int prio, const char *tag, const char *fmt, .
         line = nl + 1;
     }
 
-    std::string dest = destination();
-    const char *toStderr = getenv("TOLKD_LOG_STDERR");
-    bool alsoStderr = toStderr != nullptr && strcmp(toStderr, "1") == 0;
+    const bool alsoStderr = configured().alsoStderr;
     {
         std::lock_guard<std::recursive_mutex> lock(s.mutex);
-        int fd = dest_fd(s, dest);
+        int fd = current_fd(s);
         if (fd >= 0) write_all(fd, out, olen);
         if (fd < 0 || alsoStderr) write_all(STDERR_FILENO, out, olen);
     }
