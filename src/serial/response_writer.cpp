@@ -12,12 +12,6 @@
 
 bool gNumericMode = false;
 
-// Answer beginnings that end the text phase of an SMS command; compared in order.
-const char *const finalResultPrefixes[FINAL_RESULT_PREFIX_COUNT] = {
-    "OK",         "ERROR",         "+CMS ERROR:",         "+CMGW:",     "+CMGS:",     "+CMGC:",     "+CNMA:",
-    "\r\nOK",     "\r\nERROR",     "\r\n+CMS ERROR:",     "\r\n+CMGW:", "\r\n+CMGS:", "\r\n+CMGC:", "\r\n+CNMA:",
-};
-
 typedef struct NumericResult {
     char text[20];
     char digit;
@@ -37,14 +31,6 @@ static const NumericResult numericResultTable[] = {
 static bool startsWith(const char *data, int len, const char *prefix) {
     const size_t n = strlen(prefix);
     return len >= 0 && (size_t)len >= n && memcmp(data, prefix, n) == 0;
-}
-
-bool isFinalResult(const char *data, int len) {
-    if (data == NULL) return false;
-    for (int i = 0; i < FINAL_RESULT_PREFIX_COUNT; i++) {
-        if (startsWith(data, len, finalResultPrefixes[i])) return true;
-    }
-    return false;
 }
 
 // V.250 final result codes in verbose form, and the error reports of 27.007 and
@@ -215,8 +201,6 @@ int writeRawDataToLink(const HostLink *to, const char *data, int len) {
     if (fd < 0) return -1;
     return writeToHost(fd, data != NULL ? data : "", len);
 }
-
-int writeRawDataToSerial(const char *data, int len) { return writeRawDataToLink(NULL, data, len); }
 
 void answerPiecesReset(AnswerPieces *pieces) {
     if (pieces != NULL) memset(pieces, 0, sizeof(*pieces));

@@ -13,9 +13,6 @@
 #define RESPONSE_NOT_IMPLEMENTED 101
 #define RESPONSE_INVALID (-1)
 
-#define FINAL_RESULT_PREFIX_COUNT 14
-extern const char *const finalResultPrefixes[FINAL_RESULT_PREFIX_COUNT];
-
 extern bool gNumericMode;
 
 // Writes data (len bytes, a counted NUL allowed) framed as "\r\n" body "\r\n" to
@@ -24,7 +21,6 @@ int writeDataToSerial(const char *data, int len);
 // The same to the link a command came from; nothing when that link is gone.
 int writeDataToLink(const HostLink *to, const char *data, int len);
 // Writes len bytes as they are, like an answer that begins with an audio prefix.
-int writeRawDataToSerial(const char *data, int len);
 int writeRawDataToLink(const HostLink *to, const char *data, int len);
 
 // An answer that reaches the daemon in several pieces (longer than one buffer, or
@@ -50,8 +46,6 @@ bool isAudioResponse(const char *data, int len);
 int writeDataToserialByResponseType(int type);
 // Replaces a body that is exactly a verbose final result by its V.250 digit.
 void Response2Numeric(const char *in, char *out);
-// True when data begins with one of finalResultPrefixes.
-bool isFinalResult(const char *data, int len);
 // When data holds a complete answer, the length of the first one: everything up to
 // and including the CR LF that ends its final result line (OK, ERROR, +CME ERROR:,
 // +CMS ERROR:, or another V.250 final result code); 0 when none has come yet.
