@@ -97,9 +97,10 @@ TEST_F(TargetLinks, AnswersAreJudgedByTheirLastLine) {
     };
     for (const auto &c : cases) EXPECT_EQ(c.final, endsWithFinalResult(c.answer.data(), (int)c.answer.size())) << c.answer;
     // Where the first complete answer of a generic service read ends.
-    EXPECT_EQ(6, finalResultEnd("\r\nOK\r\nOK\r\n", 12));
-    EXPECT_EQ(0, finalResultEnd("\r\n+SN: OK\r\n\r\nOK", 19)) << "the final line has not ended yet";
-    EXPECT_EQ(26, finalResultEnd("\r\n+X: 1\r\n\r\n+CME ERROR: 3\r\nOK\r\n", 32));
+    auto end = [](const std::string &read) { return finalResultEnd(read.data(), (int)read.size()); };
+    EXPECT_EQ(6, end("\r\nOK\r\nOK\r\n"));
+    EXPECT_EQ(0, end("\r\n+SN: OK\r\n\r\nOK")) << "the final line has not ended yet";
+    EXPECT_EQ(26, end("\r\n+X: 1\r\n\r\n+CME ERROR: 3\r\nOK\r\n"));
 }
 
 // The generic service link has no framing: a read brings several answers or part
