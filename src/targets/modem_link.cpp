@@ -67,7 +67,6 @@ struct RecordReader {
     int textLen;           // data received and not yet relayed
     AnswerPieces pieces;   // an indication's framing
     HostLink to;           // an indication's link
-    bool indicationEnded;  // a NUL ended the indication's text
 };
 RecordReader rx;
 
@@ -182,7 +181,6 @@ void beginRecord(void) {
         return;
     }
     answerPiecesReset(&rx.pieces);
-    rx.indicationEnded = false;
     rx.to = currentHostLink();
 }
 
@@ -201,8 +199,8 @@ unsigned relayRecordData(bool last) {
             // NUL ends its text, and so the answer.
             const int text = (int)strnlen(rx.text, (size_t)rx.textLen);
             SlotAnswer probe = *a;
-            keepTail(&probe, rx.text, probe.textEnded ? 0 : text);
-            const bool complete = answerComplete(&probe) || probe.textEnded || text < rx.textLen;
+            keepTail(&probe, rx.text, text);
+            const bool complete = answerComplete(&probe) || text < rx.textLen;
             answerPiece(slot, rx.text, rx.textLen, complete);
             rx.textLen = 0;
             if (complete) return closeAnswer(slot);
@@ -210,7 +208,9 @@ unsigned relayRecordData(bool last) {
             return 0;
         }
     } else if (rx.header.kind != MODEM_RECORD_SLOT_LOST) {
-        if (rx.textLen > 0 || last) {
+        // Unsolicited output without any text has nothing to show.
+        const bool nothing = rx.textLen == 0 && !rx.pieces.started && rx.pieces.heldLen == 0;
+        if (!nothing) {
             LOGD("data receive from %d is %.*s", RIL_TYPE, rx.textLen, rx.text);
             writeAnswerPiece(&rx.to, &rx.pieces, rx.text, rx.textLen, last);
         }
