@@ -88,34 +88,6 @@ static bool pieceArrives(int fd) {
     return rc > 0 && (p.revents & (POLLIN | POLLHUP | POLLERR)) != 0;
 }
 
-// Receives one piece from a target other than the modem and the generic service
-// and relays it as it is framed by its content.
-static int relayOnePiece(int target, int *fd) {
-    char buf[DATA_BUF_SIZE];
-    LOGD("Read data from target:%d with fd:%d", target, *fd);
-    memset(buf, 0, sizeof(buf));
-    ssize_t n = receiveFromTarget(*fd, buf, MAX_DATA_LEN);
-    if (n < 0) {
-        LOGE("fail to receive data from target socket. errno = %d", errno);
-        closeLink(fd);
-        return -1;
-    }
-    if (n == 0) {
-        LOGD("The peer has performed an orderly shutdown, isATCmdInject %d", isATCmdInject);
-        closeLink(fd);
-        reportUeNotReady();
-        return 0;
-    }
-    isATCmdInject = false;
-    LOGD("data receive from %d is %s", target, buf);
-    LOGD("data receive data length is %d", (int)n);
-    if (target == BELVO_AUDIO_TYPE) {
-        writeDataToSerialByAudioType(buf, (int)n);
-        return 0;
-    }
-    return writeDataToSerial(buf, (int)n);
-}
-
 int readDataFromTarget(int target, int *fd) {
     if (fd == NULL) return -1;
     switch (target) {
@@ -126,7 +98,9 @@ int readDataFromTarget(int target, int *fd) {
         serveGenericLink();
         return 0;
     default:
-        return relayOnePiece(target, fd);
+        // The audio links are read only while their answer is awaited.
+        audioReaderLoop(target);
+        return 0;
     }
 }
 

@@ -8,8 +8,8 @@
 extern bool isATCmdInject;
 
 // Serves one readable target link: the modem pair and the generic service link
-// relay every complete answer (modem_link.h, generic_link.h), an audio link one
-// piece of its answer.
+// relay every complete answer (modem_link.h, generic_link.h), an audio link its
+// answer (audioReaderLoop).
 int readDataFromTarget(int target, int *fd);
 int readDataFromTargetWithResult(int target, int *fd, char *buf, int size);
 // Waits for the generic service's answer to the command just sent and relays it.

@@ -196,7 +196,8 @@ TEST_F(TargetLinks, PeerShutdownReportsUeNotReadyOnceWhileAModemCommandIsOutstan
     int pipeFds[2];
     ASSERT_EQ(0, pipe(pipeFds));
     peers.push_back(pipeFds[1]);
-    s_fdAudio_command = pipeFds[0];  // recv on a pipe fails with ENOTSOCK
+    s_fdAudio_command = pipeFds[0];  // readable, but recv on a pipe fails with ENOTSOCK
+    writeAll(pipeFds[1], "x");
     isATCmdInject = true;
     readDataFromTarget(AUDIO_TYPE, &s_fdAudio_command);
     EXPECT_EQ(-1, fcntl(pipeFds[0], F_GETFD));
