@@ -18,6 +18,7 @@
 #include <ftw.h>
 #include <poll.h>
 #include <pthread.h>
+#include <sched.h>
 #include <signal.h>
 #include <stdarg.h>
 #include <stdio.h>
@@ -907,20 +908,124 @@ void measureStart() {
                      s.n ? fmt("max %s over %zu starts", us(stats(v).p99).c_str(), s.n) : "", "", ""});
 }
 
+// ---------------------------------------------------------------- one local command
+
+// Every thread of pid (and so the HAL threads too) onto one CPU.
+bool pinProcess(pid_t pid, int cpu) {
+    cpu_set_t set;
+    CPU_ZERO(&set);
+    CPU_SET(cpu, &set);
+    DIR *d = opendir(("/proc/" + std::to_string(pid) + "/task").c_str());
+    if (d == nullptr) return false;
+    bool ok = true;
+    while (struct dirent *e = readdir(d)) {
+        if (e->d_name[0] == '.') continue;
+        if (sched_setaffinity(atoi(e->d_name), sizeof set, &set) != 0) ok = false;
+    }
+    closedir(d);
+    return ok;
+}
+
+// The cost of one local adb command, AT+CSDF?, as two figures that the load of
+// other work on the machine moves little: the instructions the daemon executes
+// per command (callgrind, counters zeroed after a warm-up and dumped after
+// `count` commands), and the round trip with the client and the daemon pinned
+// to the same CPU, next to the reference responder pinned the same way, so that
+// every cycle of the exchange is spent on one CPU in turn.
+int measureOneCommand(int count) {
+    const int cpu = 0;
+    cpu_set_t mine;
+    CPU_ZERO(&mine);
+    CPU_SET(cpu, &mine);
+    if (sched_setaffinity(0, sizeof mine, &mine) != 0) perror("sched_setaffinity");
+
+    auto pinnedRoundTrips = [&](Device &dev) {
+        Stats s;
+        if (!dev.ok() || !pinProcess(dev.pid(), cpu)) return s;
+        int fd = dev.connectAdb();
+        if (fd < 0) return s;
+        s = stats(roundTrips(fd, "AT+CSDF?", count));
+        close(fd);
+        return s;
+    };
+    Stats tolkd, ref;
+    {
+        Device dev("tolkd pinned", {});
+        tolkd = pinnedRoundTrips(dev);
+    }
+    {
+        Device dev("reference pinned", {}, gCfg.ref);
+        ref = pinnedRoundTrips(dev);
+    }
+
+    // tolkd under callgrind: tolk-sim starts the wrapper in tolkd's place.
+    double perCommand = -1;
+    char tmpl[] = "/tmp/tbcgXXXXXX";
+    if (mkdtemp(tmpl) != nullptr) {
+        std::string dir = tmpl, wrapper = dir + "/tolkd-callgrind", out = dir + "/callgrind.out";
+        {
+            std::ofstream w(wrapper);
+            w << "#!/bin/sh\nexec valgrind --tool=callgrind --callgrind-out-file=" << out << " " << gCfg.tolkd
+              << "\n";
+        }
+        chmod(wrapper.c_str(), 0755);
+        Device dev("tolkd under callgrind", {}, wrapper);
+        int fd = dev.ok() ? dev.connectAdb() : -1;
+        bool warm = fd >= 0;
+        for (int i = 0; warm && i < 50; i++) warm = exchangeLine(fd, "AT+CSDF?\r", nullptr, 10000) >= 0;
+        std::string pid = std::to_string(dev.pid());
+        if (warm && runProgram({"callgrind_control", "-z", pid}) == 0) {
+            int done = 0;
+            while (done < count && exchangeLine(fd, "AT+CSDF?\r", nullptr, 10000) >= 0) done++;
+            runProgram({"callgrind_control", "-d", pid});
+            // The dump of -d is the output file with a counter appended.
+            long long total = -1;
+            DIR *d = opendir(dir.c_str());
+            while (d != nullptr) {
+                struct dirent *e = readdir(d);
+                if (e == nullptr) break;
+                if (strncmp(e->d_name, "callgrind.out.", 14) != 0) continue;
+                std::istringstream in(readFile(dir + "/" + e->d_name));
+                std::string line;
+                while (std::getline(in, line))
+                    if (line.compare(0, 8, "summary:") == 0 || line.compare(0, 7, "totals:") == 0)
+                        total = atoll(line.c_str() + line.find(':') + 1);
+            }
+            if (d != nullptr) closedir(d);
+            if (total >= 0 && done > 0) perCommand = static_cast<double>(total) / done;
+            printf("callgrind: %lld instructions over %d commands\n", total, done);
+        }
+        if (fd >= 0) close(fd);
+    }
+    if (!getenv("TOLK_BENCH_KEEP")) nftw(tmpl, removeEntry, 16, FTW_DEPTH | FTW_PHYS);
+
+    printf("tolkd: %s\n", gCfg.tolkd.c_str());
+    printf("instructions per adb AT+CSDF? (callgrind, info filter): %.0f\n", perCommand);
+    printf("pinned round trip median / p99: tolkd %s / %s, reference %s / %s (%.2fx at the median)\n",
+           us(tolkd.median).c_str(), us(tolkd.p99).c_str(), us(ref.median).c_str(), us(ref.p99).c_str(),
+           ref.median > 0 ? tolkd.median / ref.median : 0);
+    return perCommand > 0 && tolkd.n > 0 ? 0 : 1;
+}
+
 void usage() {
-    printf("usage: tolkd-bench [--quick] [--sim PATH] [--tolkd PATH] [--ref PATH]\n"
+    printf("usage: tolkd-bench [--quick] [--one-command] [--sim PATH] [--tolkd PATH] [--ref PATH]\n"
            "  Runs every measurement on fresh simulated devices and prints one table.\n"
            "  --quick   fewer samples and 2 idle seconds (a smoke run, not for figures)\n"
+           "  --one-command  only the cost of one local adb command: instructions per\n"
+           "            AT+CSDF? under callgrind, and its round trip pinned to one CPU\n"
            "  TOLK_BENCH_KEEP=1 keeps the device roots.\n");
 }
 
 }  // namespace
 
 int main(int argc, char **argv) {
+    bool oneCommand = false;
     for (int i = 1; i < argc; i++) {
         std::string a = argv[i];
         if (a == "--quick") {
             gCfg.quick = true;
+        } else if (a == "--one-command") {
+            oneCommand = true;
         } else if ((a == "--sim" || a == "--tolkd" || a == "--ref") && i + 1 < argc) {
             (a == "--sim" ? gCfg.sim : a == "--tolkd" ? gCfg.tolkd : gCfg.ref) = argv[++i];
         } else {
@@ -939,6 +1044,7 @@ int main(int argc, char **argv) {
     }
     signal(SIGPIPE, SIG_IGN);
     startWatchdog();
+    if (oneCommand) return measureOneCommand(gCfg.quick ? 200 : 1000);
 
     Figures f = measureRoundTrips();
     LogFigures lg = measureLogging();

@@ -30,6 +30,8 @@ const char kCitPrefix[] = "AT*CIT";
 const char kAnswerOk[] = "\r\nOK\r\n";
 const char kAnswerError[] = "\r\nERROR\r\n";
 const char kRunningProp[] = "debug.autocit.running";
+// How long the pieces of one answer of the test application may lie apart.
+const int CIT_PIECE_WAIT_MS = 50;
 
 // How the test application's answer is judged.
 enum CitRule {
@@ -522,6 +524,16 @@ int cit_socket_write(const char *word, char *answerBuf) {
     do {
         rc = recv(sock_id, answerBuf, CIT_ANSWER_SIZE - 1, 0);
     } while (rc < 0 && errno == EINTR);
+    // The answer may reach the daemon in pieces: a "Fail..." judged on its first
+    // two letters would pass. Its pieces follow each other closely.
+    while (rc > 0 && rc < CIT_ANSWER_SIZE - 1) {
+        struct pollfd p = {sock_id, POLLIN, 0};
+        if (poll(&p, 1, CIT_PIECE_WAIT_MS) <= 0) break;
+        ssize_t more = recv(sock_id, answerBuf + rc, (size_t)(CIT_ANSWER_SIZE - 1 - rc), 0);
+        if (more < 0 && errno == EINTR) continue;
+        if (more <= 0) break;
+        rc += more;
+    }
     if (rc < 0) answerBuf[0] = '\0';
     else answerBuf[rc] = '\0';
     fprintf(stderr, "[%s]:  buffer : %s\n", "getResult", answerBuf);

@@ -1,6 +1,7 @@
 // The reading half of the main loop: wait on the host links and on the target links
-// that answer asynchronously, relay target answers, and turn host input into one
-// command line in cmdBuf.
+// that answer asynchronously, let the targets relay their answers, and turn host
+// input into one command line in cmdBuf. Every byte the host sends belongs to a
+// line: an adb read may carry several lines, or part of one.
 #include "core/reader.h"
 
 #include <errno.h>
@@ -15,10 +16,14 @@
 #include "core/sms_merge.h"
 #include "core/tolkd_log.h"
 #include "dispatch/dispatcher.h"
+#include "targets/generic_link.h"
+#include "targets/modem_link.h"
 #include "targets/target_conn.h"
 #include "targets/target_relay.h"
 
 int tolk_conn_mode = 1;
+bool lineKeptAsTyped = false;
+bool msgCmdLfPending = false;
 
 #define CONN_MODE_VCOM 1
 #define CONN_MODE_ADB 2
@@ -34,6 +39,11 @@ int tolk_conn_mode = 1;
 // How long each extra read of the repair waits for the next piece.
 #define MMITEST_PIECE_WAIT_MS 50
 
+// SMS text ends at Ctrl-Z (send) or ESC (cancel); on the serial port the line
+// discipline ends a line there, on adb the reader does while text is typed.
+#define CTRL_Z 0x1A
+#define ESC 0x1B
+
 #define SERIAL_REOPEN_ATTEMPTS 3
 // Pause after a failed accept while nothing else is ready, so that a listener that
 // keeps failing (descriptor table full) does not spin the main loop.
@@ -42,9 +52,10 @@ int tolk_conn_mode = 1;
 static char lineBuf[DATA_BUF_SIZE];
 static char adbBuf[DATA_BUF_SIZE];
 
-// The adb line being assembled. It lives apart from lineBuf so that a serial line
-// read while an adb line is half complete neither overwrites nor steals its bytes;
-// it survives reading cycles until its CR arrives or its connection goes away.
+// The adb bytes not yet taken as lines: the line being assembled and any lines that
+// came behind it in the same reads. They live apart from lineBuf so that a serial
+// line read meanwhile neither overwrites nor steals them; they survive reading
+// cycles until they are taken or their connection goes away.
 static char adbLine[DATA_BUF_SIZE];
 static int adbLineLen = 0;
 
@@ -78,15 +89,19 @@ int adb_socket_accept(int listenFd) {
     return fd;
 }
 
-// Reads from a host slot into buf (DATA_BUF_SIZE bytes, zeroed by the caller).
+// Reads at most want bytes from a host slot into buf (DATA_BUF_SIZE bytes) and
+// terminates them.
 // Returns the byte count, or -1 when the adb connection is gone. A dead serial port
 // is reopened in place; if that is impossible the daemon has no reason to live.
-static int readFromHost(SerialDevice *dev, int slot, char *buf) {
+static int readFromHost(SerialDevice *dev, int slot, char *buf, int want) {
     for (;;) {
         int fd = dev->fd[slot];
         LOGD("Wait for read data from USB :%d", fd);
-        ssize_t n = read(fd, buf, MAX_DATA_LEN);
-        if (n > 0) return (int)n;
+        ssize_t n = read(fd, buf, (size_t)want);
+        if (n > 0) {
+            buf[n] = '\0';  // want is at most MAX_DATA_LEN
+            return (int)n;
+        }
         if (n < 0 && (errno == EINTR || errno == EAGAIN)) continue;
 
         LOGE("FATAL Error in serail read:%d", errno);
@@ -105,7 +120,6 @@ static int readFromHost(SerialDevice *dev, int slot, char *buf) {
             exit(1);
         }
         LOGD("The FD is FATAL Error reopen successfully");
-        memset(buf, 0, DATA_BUF_SIZE);
     }
 }
 
@@ -128,10 +142,9 @@ static bool pieceArrives(int fd) {
 // 51 bytes is repaired: a longer line cannot be a frame that lost bytes, and waiting
 // for more would swallow the host's next command line. Extra reads ask only for the
 // bytes still missing, so the frame never grows past 51 bytes, and each waits a
-// bounded time. *ownLen is set to the bytes that came with the first read (the two
-// put back included): whatever follows them was read from later input.
-static int repairMmitestFrame(int fd, char *buf, int n, int *ownLen) {
-    *ownLen = n;
+// bounded time. On adb whatever the read holds behind the frame's line end stays
+// as the next lines.
+static int repairMmitestFrame(int fd, char *buf, int n) {
     if (n == MMITEST_FRAME_LEN || strncmp(buf, MMITEST_FRAME_PREFIX, MMITEST_FRAME_PREFIX_LEN) != 0) return n;
 
     for (int i = 0; i < 16; i++) LOGE("p_buffer[%d]=0x%x", i, (unsigned char)buf[i]);
@@ -146,7 +159,6 @@ static int repairMmitestFrame(int fd, char *buf, int n, int *ownLen) {
             buf[MMITEST_FIX_OFFSET + 1] = (char)0xA8;
             memcpy(buf + MMITEST_FIX_OFFSET + 2, scratch, tail);
             n += 2;
-            *ownLen = n;
         }
         for (int tries = 0; n < MMITEST_FRAME_LEN && tries < MMITEST_MAX_EXTRA_READS; tries++) {
             LOGD("to read the data for ffa8 & ff99");
@@ -168,54 +180,44 @@ static int repairMmitestFrame(int fd, char *buf, int n, int *ownLen) {
     return n;
 }
 
-// Moves a completed adb line of len bytes from adbLine to lineBuf and starts the
-// next line with carry bytes of src.
-static int completeAdbLine(int len, const char *src, int carry) {
-    LOGD(".AT command read done.");
-    memcpy(lineBuf, adbLine, len);
-    lineBuf[len] = '\0';
-    discardAdbLine();
-    if (carry > 0) {
-        memcpy(adbLine, src, carry);
-        adbLineLen = carry;
+// The length of the first complete line among the adb bytes, or 0. A line ends at
+// CR, during SMS text input also at Ctrl-Z and ESC (the host ends a message body
+// without a CR), or at 6144 bytes.
+static int adbLineEnd(void) {
+    for (int i = 0; i < adbLineLen; i++) {
+        const char c = adbLine[i];
+        if (c == '\r' || (isMsgCmdInput && (c == CTRL_Z || c == ESC))) return i + 1;
     }
+    return adbLineLen >= MAX_DATA_LEN ? MAX_DATA_LEN : 0;
+}
+
+// Moves the first complete adb line to lineBuf; the bytes behind it stay for the
+// next lines. Returns its length, or 0 when no line is complete yet.
+static int takeAdbLine(void) {
+    const int len = adbLineEnd();
+    if (len == 0) return 0;
+    LOGD(".AT command read done.");
+    memcpy(lineBuf, adbLine, (size_t)len);
+    lineBuf[len] = '\0';
+    const int rest = adbLineLen - len;
+    memmove(adbLine, adbLine + len, (size_t)rest);
+    memset(adbLine + rest, 0, (size_t)len);
+    adbLineLen = rest;
     return len;
 }
 
-// Adds the new adb bytes to the line being assembled. Returns the length of the
-// completed line (now in lineBuf), or 0 when the line needs more bytes. A line ends
-// at CR or at 6144 bytes. The rest of the same packet is dropped (one line per
-// packet), but bytes from ownLen on were read from later packets by the frame
-// repair: they belong to the host's next line and stay for it.
-static int assembleAdbLine(const char *bytes, int n, int ownLen) {
-    for (int i = 0; i < n; i++) {
-        int off = adbLineLen + i;
-        adbLine[off] = bytes[i];
-        if (bytes[i] == '\r' || off > MAX_DATA_LEN - 2) {
-            int next = i + 1 > ownLen ? i + 1 : ownLen;
-            int carry = n > next ? n - next : 0;
-            return completeAdbLine(off + 1, bytes + next, carry);
-        }
-    }
-    LOGD(".AT command read more.");
+// Adds n bytes read from the adb connection; returns the length of a completed
+// line (now in lineBuf), or 0 when it needs more bytes.
+static int assembleAdbLine(const char *bytes, int n) {
+    const int room = MAX_DATA_LEN - adbLineLen;
+    if (n > room) n = room;  // the read asked for no more than there is room for
+    memcpy(adbLine + adbLineLen, bytes, (size_t)n);
     adbLineLen += n;
-    LOGD(".go on read.");
-    return 0;
-}
-
-// A line that the frame repair carried over may already be complete; it is served
-// before the reader waits for more input. Returns its length, or 0.
-static int takeCarriedAdbLine(void) {
-    const char *cr = (const char *)memchr(adbLine, '\r', (size_t)adbLineLen);
-    if (cr == NULL) return 0;
-    int len = (int)(cr - adbLine) + 1;
-    LOGD(".AT command read done.");
-    memcpy(lineBuf, adbLine, len);
-    lineBuf[len] = '\0';
-    int rest = adbLineLen - len;
-    memmove(adbLine, adbLine + len, rest);
-    memset(adbLine + rest, 0, len);
-    adbLineLen = rest;
+    const int len = takeAdbLine();
+    if (len == 0) {
+        LOGD(".AT command read more.");
+        LOGD(".go on read.");
+    }
     return len;
 }
 
@@ -237,18 +239,28 @@ static int acceptAdbConnection(SerialDevice *dev) {
     }
     closeAdbConnection(dev);
     dev->fd[DEVICE_ADB] = fd;
+    // Answers still due to the connection just replaced must not reach this one.
+    gAdbConnection++;
     // The new connection is read once select reports it readable: a host that
     // connects and says nothing must not hold up the serial port and the modem.
     return 0;
 }
 
-// Turns a complete host line of n bytes in lineBuf into the command line in cmdBuf.
-// Returns cmdBuf, or NULL when the line is no command and is dropped.
-static char *acceptLine(SerialDevice *dev, int n) {
+// Turns a complete host line of n bytes in lineBuf, read from slot, into the
+// command line in cmdBuf. Returns cmdBuf, or NULL when the line is no command and
+// is dropped. Only a line taken on makes its link the current one.
+static char *acceptLine(SerialDevice *dev, int slot, int n) {
     LOGD("state %d with %d:%d", dev->state, 0, (unsigned char)lineBuf[0]);
+    const bool lfAfterCommand = msgCmdLfPending;
+    msgCmdLfPending = false;
 
-    // SMS body text; a lone LF is only the tail of the command line's CR LF.
-    if (isMsgCmdInput && !(n == 1 && lineBuf[0] == '\n')) return handleMsgTextLine(dev, lineBuf, n);
+    if (isMsgCmdInput) {
+        // A lone LF right after the SMS command line is the rest of its CR LF;
+        // inside the body it is an empty line of the message.
+        if (n == 1 && lineBuf[0] == '\n' && lfAfterCommand) return NULL;
+        dev->currDevice = slot;
+        return handleMsgTextLine(dev, lineBuf, n);
+    }
 
     int readCurr = audio_command_hdlr(lineBuf);
     if (readCurr <= 0) {
@@ -257,37 +269,51 @@ static char *acceptLine(SerialDevice *dev, int n) {
         readCurr = 2;
     }
 
+    dev->currDevice = slot;
     dev->state = 3;
     dev->cmdLen = n;
     LOGD("the readCurr is %d & the total size is %d", readCurr, n);
     memcpy(dev->cmdBuf, lineBuf, n);
     dev->cmdBuf[n] = '\0';
-    // Device-maker audio commands go out byte for byte, delimiter included.
-    if (belvo_audio_command_hdlr(lineBuf) == 0) dev->cmdBuf[n - 1] = '\0';
+    // Device-maker audio commands go out byte for byte, delimiter included, and
+    // routing leaves their case alone.
+    lineKeptAsTyped = belvo_audio_command_hdlr(lineBuf) != 0;
+    if (!lineKeptAsTyped) dev->cmdBuf[n - 1] = '\0';
     return dev->cmdBuf;
+}
+
+// How long select may sleep: until an answer without its final result must be
+// taken as complete.
+static struct timeval *selectTimeout(struct timeval *tv) {
+    const int generic = genericLinkQuietMs(), modem = modemLinkQuietMs();
+    const int ms = generic < 0 ? modem : modem < 0 ? generic : (generic < modem ? generic : modem);
+    if (ms < 0) return NULL;
+    tv->tv_sec = ms / 1000;
+    tv->tv_usec = (ms % 1000) * 1000;
+    return tv;
 }
 
 char *readline(SerialDevice *dev) {
     LOGD("Enter");
-    memset(lineBuf, 0, sizeof(lineBuf));
-    memset(adbBuf, 0, sizeof(adbBuf));
     tolk_conn_mode = CONN_MODE_VCOM;
 
+    // Every line is terminated where it ends, so the buffers are emptied, not
+    // cleared: clearing 6 KB three times was a fifth of what a command cost.
     for (;;) {
         // While SMS text is merged, cmdBuf holds the message collected so far.
         if (!isNeedMergeMsgCmdInput) {
-            memset(dev->cmdBuf, 0, sizeof(dev->cmdBuf));
+            dev->cmdBuf[0] = '\0';
             dev->cmdLen = 0;
         }
-        memset(lineBuf, 0, sizeof(lineBuf));
+        lineBuf[0] = '\0';
         dev->state = 0;
 
+        // Lines that came in the reads before are served before the next wait.
         if (dev->fd[DEVICE_ADB] >= 0 && adbLineLen > 0) {
-            int n = takeCarriedAdbLine();
+            int n = takeAdbLine();
             if (n > 0) {
                 tolk_conn_mode = CONN_MODE_ADB;
-                dev->currDevice = DEVICE_ADB;
-                char *line = acceptLine(dev, n);
+                char *line = acceptLine(dev, DEVICE_ADB, n);
                 if (line != NULL) return line;
                 continue;
             }
@@ -313,7 +339,14 @@ char *readline(SerialDevice *dev) {
         if (s_fdService_command >= 1 && selectable(s_fdService_command)) watch(s_fdService_command, &readSet, &maxFd);
 
         LOGD("Wait for select data from USB");
-        if (select(maxFd + 1, &readSet, NULL, NULL, NULL) < 0) {
+        struct timeval tv;
+        const int ready = select(maxFd + 1, &readSet, NULL, NULL, selectTimeout(&tv));
+        if (ready == 0) {
+            genericLinkQuiet();
+            msgTextPhaseEndedBy(modemLinkQuiet());
+            continue;
+        }
+        if (ready < 0) {
             if (errno == EINTR || errno == EAGAIN) continue;
             LOGE("Fail to select in readline. error: %d", errno);
             for (int slot = DEVICE_SERIAL; slot < DEVICE_COUNT; slot++) {
@@ -327,12 +360,12 @@ char *readline(SerialDevice *dev) {
         }
 
         if (s_fdRild_command >= 1 && isReady(s_fdRild_command, &readSet)) {
-            readDataFromTarget(RIL_TYPE, &s_fdRild_command);
+            msgTextPhaseEndedBy(serveModemLink());
             continue;
         }
         if (s_fdService_command > 0 && isReady(s_fdService_command, &readSet)) {
             LOGD("readline: Prepare read the data from generic service");
-            readDataFromTarget(GENERIC_TYPE, &s_fdService_command);
+            if (serveGenericLink()) msgTextPhaseEndedBy(TEXT_PHASE_ANY);
             continue;
         }
         int slot = DEVICE_SERIAL;
@@ -352,33 +385,37 @@ char *readline(SerialDevice *dev) {
 
         LOGD("Read data from USB:%d:%d", slot, dev->fd[slot]);
         char *buf;
+        int want = MAX_DATA_LEN;
         if (slot == DEVICE_SERIAL) {
             buf = lineBuf;
             tolk_conn_mode = CONN_MODE_VCOM;
         } else {
             buf = adbBuf;
             tolk_conn_mode = CONN_MODE_ADB;
+            // No more than the adb bytes still waiting leave room for.
+            want = MAX_DATA_LEN - adbLineLen;
         }
-        memset(buf, 0, DATA_BUF_SIZE);
 
-        int n = readFromHost(dev, slot, buf);
+        int n = readFromHost(dev, slot, buf, want);
         if (n < 0) return NULL;
         LOGD("the readCount is %d with %s:%d", n, buf, (unsigned char)buf[0]);
         if (tolk_conn_mode == CONN_MODE_VCOM) {
             LOGD("VCOM mode, sleep 0.01s");
             usleep(10 * 1000);
         }
-        int ownLen = n;
-        n = repairMmitestFrame(dev->fd[slot], buf, n, &ownLen);
+        // A frame begins a line; on adb only a read that starts one can hold it.
+        if (slot == DEVICE_SERIAL || adbLineLen == 0) {
+            n = repairMmitestFrame(dev->fd[slot], buf, n);
+            buf[n] = '\0';
+        }
 
-        dev->currDevice = slot;
         LOGD("tolk_conn_mode = [%d], [%x]", tolk_conn_mode, (unsigned char)buf[0]);
 
         if (tolk_conn_mode == CONN_MODE_ADB) {
-            n = assembleAdbLine(adbBuf, n, ownLen);
+            n = assembleAdbLine(adbBuf, n);
             if (n == 0) continue;
         }
-        char *line = acceptLine(dev, n);
+        char *line = acceptLine(dev, slot, n);
         if (line != NULL) return line;
     }
 }

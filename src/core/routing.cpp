@@ -1,6 +1,7 @@
-// The routing half of the main loop: normalise each command line, let the dispatcher
-// run the local handlers and name the command type, and hand the line to whoever
-// answers that type (modem, generic service, audio service, factory tests).
+// The routing half of the main loop: normalise each command line, parse it once,
+// let the dispatcher run the local handlers and name the command type, and hand the
+// line to whoever answers that type (modem, generic service, audio service, factory
+// tests), with the host link that sent it, where its answer goes.
 #include "core/reader.h"
 
 #include <signal.h>
@@ -12,14 +13,18 @@
 #include "cit/cit_cmd.h"
 #include "core/sms_merge.h"
 #include "core/tolkd_log.h"
+#include "dispatch/command_line.h"
 #include "dispatch/dispatcher.h"
 #include "hal/tolkd_adaptation.h"
 #include "serial/response_writer.h"
+#include "targets/generic_link.h"
 #include "targets/mmi_queue.h"
+#include "targets/modem_link.h"
 #include "targets/target_conn.h"
 #include "targets/target_relay.h"
 
 bool isMsgCmdInput = false;
+unsigned msgTextPhase = 0;
 
 // Read once per start; OP07 and OP12 change the daemon's behaviour.
 static char operatorCode[PROPERTY_VALUE_MAX];
@@ -38,6 +43,16 @@ void readerLoopPreamble(void) {
     } else {
         property_set("persist.service.pct.mode", "1");
     }
+}
+
+void endMsgTextPhase(void) {
+    if (isMsgCmdInput || isNeedMergeMsgCmdInput) LOGD("SMS text input ends");
+    isMsgCmdInput = false;
+    isNeedMergeMsgCmdInput = false;
+}
+
+void msgTextPhaseEndedBy(unsigned phase) {
+    if (phase == TEXT_PHASE_ANY || (phase != 0 && phase == msgTextPhase)) endMsgTextPhase();
 }
 
 void readerLoop(SerialDevice *dev) {
@@ -70,7 +85,8 @@ static bool modemAccessAllowed(const char *line) {
     return isBareAt(line);
 }
 
-static void routeToModem(SerialDevice *dev, const char *line) {
+static void routeToModem(SerialDevice *dev, const CommandLine *cmd) {
+    const char *line = cmd->text;
     if (!modemAccessAllowed(line)) {
         LOGI("%s", kUserModeRefusal);
         writeDataToSerial(kUserModeRefusal, (int)sizeof(kUserModeRefusal));
@@ -80,11 +96,13 @@ static void routeToModem(SerialDevice *dev, const char *line) {
         return;
     }
     if (s_fdRild_command < 0) connectTarget(RIL_TYPE);
-    mmiCmdSeqEnQueue();
 
+    unsigned phase = 0;
     if (isMsgCmd(line)) {
         LOGI("set isMsgCmd true");
         isMsgCmdInput = true;
+        phase = ++msgTextPhase;
+        msgCmdLfPending = true;
         if (strcmp(operatorCode, "OP12") == 0 && startMergeMsgCmdInputIfNeed(dev, line)) {
             // Held until its text is complete; the merged command goes out then.
             isNeedMergeMsgCmdInput = true;
@@ -99,39 +117,49 @@ static void routeToModem(SerialDevice *dev, const char *line) {
         LOGI("set Numeric flag true");
         gNumericMode = true;
     }
-    sendDataToRild(line);
+    // A command that never reached the modem gets no answer from it, so its text
+    // phase would never end: the host's next lines would be taken as message text.
+    if (sendToModem(line, &cmd->origin, phase) < 0 && phase != 0) endMsgTextPhase();
 }
 
-static void routeToGenericService(const char *line) {
+static void routeToGenericService(const CommandLine *cmd) {
+    const char *line = cmd->text;
     if (s_fdService_command < 0) connectTarget(GENERIC_TYPE);
-    sendDataToGenericService(line);
+    if (s_fdService_command < 0 || sendDataToGenericService(line) < 0) {
+        // No answer can come; a station must not wait for one until its timeout.
+        writeDataToserialByResponseType(RESPONSE_ERROR);
+        return;
+    }
     if (strcmp(line, "AT+POWERKEY") == 0) {
         // The host expects the power key answer before anything else.
         LOGI("+POWERKEY COMMAND");
         serviceReaderLoop();
     } else {
         LOGI("Generic AT COMMAND");
+        genericCommandSent(&cmd->origin);
     }
 }
 
 // Audio commands go out with the byte count as read, never more than the buffer
 // still holds behind the (possibly trimmed) line.
-static int audioLength(const SerialDevice *dev, const char *line) {
+static int audioLength(const SerialDevice *dev, const CommandLine *cmd) {
+    const char *line = cmd->text;
     long room = (long)sizeof(dev->cmdBuf) - (line - dev->cmdBuf);
     if (line < dev->cmdBuf || room <= 0) return (int)strlen(line);
-    return dev->cmdLen < room ? dev->cmdLen : (int)room;
+    return cmd->len < room ? cmd->len : (int)room;
 }
 
-static void routeToAudio(SerialDevice *dev, const char *line, int type) {
+static void routeToAudio(SerialDevice *dev, const CommandLine *cmd, int type) {
     LOGI("AUDIO COMMAND");
     if ((type == AUDIO_TYPE && s_fdAudio_command < 0) || (type == AUDIO_EXT_TYPE && s_fdAudioExt_command < 0)) {
         connectTarget(type);
     }
-    sendDataToAudio(line, audioLength(dev, line), type);
+    sendDataToAudio(cmd->text, audioLength(dev, cmd), type);
     audioReaderLoop(type);
 }
 
-static void routeToBelvoAudio(SerialDevice *dev, const char *line) {
+static void routeToBelvoAudio(SerialDevice *dev, const CommandLine *cmd) {
+    const char *line = cmd->text;
     LOGI("BELVO AUDIO COMMAND");
     if (s_fdAudio_command < 0) connectTarget(BELVO_AUDIO_TYPE);
     // The MMI test settings must be in force before the command reaches the test
@@ -139,7 +167,7 @@ static void routeToBelvoAudio(SerialDevice *dev, const char *line) {
     bool enable = strncmp(line, "AT^MMITESTENABLE=1", 18) == 0 || strncmp(line, "at^mmitestenable=1", 18) == 0;
     bool disable = strncmp(line, "AT^MMITESTENABLE=0", 18) == 0 || strncmp(line, "at^mmitestenable=0", 18) == 0;
     if (enable) setMMITESTOption(1);
-    sendDataToAudio(line, audioLength(dev, line), BELVO_AUDIO_TYPE);
+    sendDataToAudio(line, audioLength(dev, cmd), BELVO_AUDIO_TYPE);
     audioReaderLoop(BELVO_AUDIO_TYPE);
     if (disable) setMMITESTOption(0);
 }
@@ -147,38 +175,42 @@ static void routeToBelvoAudio(SerialDevice *dev, const char *line) {
 void routeCommandLine(SerialDevice *dev, char *line) {
     LOGI("Command:[%s]", line != NULL ? line : "(null)");
     if (line == NULL) return;
+    // The reader made the line's link the current one.
+    const HostLink origin = currentHostLink();
 
     if (isMsgCmdInput) {
-        routeMsgTextLine(dev);
+        routeMsgTextLine(dev, &origin);
         return;
     }
 
     // Device-maker audio commands reach their tool exactly as typed.
-    if (belvo_audio_command_hdlr(line) == 0) {
+    if (!lineKeptAsTyped) {
         convertToUpperCase(line, '=');
         trim_string(&line);
     }
 
     LOGI("Command:%s", line);
-    int type = process_cmd_line(line);
+    CommandLine cmd;
+    parseCommandLine(&cmd, line, dev->cmdLen, &origin);
+    int type = dispatchCommandLine(&cmd);
     LOGI("The command type is belonged to :%d", type);
 
     switch (type) {
     case RIL_TYPE:
-        routeToModem(dev, line);
+        routeToModem(dev, &cmd);
         break;
     case AUDIO_TYPE:
     case AUDIO_EXT_TYPE:
-        routeToAudio(dev, line, type);
+        routeToAudio(dev, &cmd, type);
         break;
     case TOLK_TYPE:
         LOGI("TOLK COMMAND");
         break;
     case GENERIC_TYPE:
-        routeToGenericService(line);
+        routeToGenericService(&cmd);
         break;
     case BELVO_AUDIO_TYPE:
-        routeToBelvoAudio(dev, line);
+        routeToBelvoAudio(dev, &cmd);
         break;
     case BELVO_AUTIOCIT_TYPE:
         LOGI("BELVO_AUTIOCIT_TYPE");

@@ -15,12 +15,14 @@
 #include "core/reader.h"
 #include "core/tolkd_log.h"
 #include "dispatch/dispatcher.h"
-#include "hal/tolkd_adaptation.h"
 #include "serial/response_writer.h"
+#include "targets/modem_link.h"
 #include "targets/target_conn.h"
 
 bool isNeedMergeMsgCmdInput = false;
 int msgCmdMode = 0;
+// The merged command is complete: the message is whole once it has gone out.
+static bool mergedMessageReady = false;
 
 #define MSG_CMD_COUNT 4
 static const char msgCmdTable[MSG_CMD_COUNT][CMD_NAME_SIZE] = {
@@ -156,16 +158,28 @@ char *handleMsgTextLine(SerialDevice *dev, char *lineBuf, int n) {
             dev->cmdLen += (int)strlen(kClosing);
         }
         if (len > 3) buf[3] = 'E';
+        mergedMessageReady = true;
         LOGD("isNeedMergeMsgCmdInput update buffer: %s", buf);
     }
     return buf;
 }
 
-void routeMsgTextLine(SerialDevice *dev) {
+void routeMsgTextLine(SerialDevice *dev, const HostLink *origin) {
     if (isNeedMergeMsgCmdInput) {
         writeDataToSerial(kPrompt, (int)sizeof(kPrompt));
         return;
     }
     if (s_fdRild_command < 0) connectTarget(RIL_TYPE);
-    sendDataToRild(dev->cmdBuf);
+    // Ctrl-Z (send) or ESC (cancel) ends the message with this line, and so does a
+    // merged command, which carries the whole message: the host's next line is a
+    // command again. A line the modem never got ends it too, since no final result
+    // will come for it.
+    const char *text = dev->cmdBuf;
+    bool ends = mergedMessageReady || strchr(text, CTRL_Z) != NULL || strchr(text, ESC) != NULL;
+    mergedMessageReady = false;
+    if (sendToModem(text, origin, msgTextPhase) < 0) ends = true;
+    if (ends) {
+        LOGD(" SUB or ESC in line, clear isMsgCmdInput");
+        endMsgTextPhase();
+    }
 }

@@ -14,7 +14,8 @@ int getMsgCmdParameterCount(const char *line);
 int startMergeMsgCmdInputIfNeed(SerialDevice *dev, const char *line);
 // Reader side: puts a text line (n bytes in lineBuf) or the merged command into cmdBuf.
 char *handleMsgTextLine(SerialDevice *dev, char *lineBuf, int n);
-// Routing side: prompt for more text, or send the text line / merged command.
-void routeMsgTextLine(SerialDevice *dev);
+// Routing side: prompt for more text, or send the text line / merged command;
+// its answer goes to origin.
+void routeMsgTextLine(SerialDevice *dev, const HostLink *origin);
 
 #endif

@@ -18,6 +18,7 @@
 #include "core/reader.h"
 #include "core/tolkd_log.h"
 #include "serial/serial_device.h"
+#include "targets/mmi_queue.h"
 
 int getBootMode(void) {
     int fd = open(BOOT_MODE_FILE, O_RDONLY);
@@ -68,6 +69,7 @@ int tolkdMain(void) {
 
     SerialDevice *dev = &gSerialDevice;
     initSerialDevice(dev);
+    mmiCmdSeqReset();
     snprintf(dev->devName[DEVICE_SERIAL], 12, "%s", SERIAL_DEV_NAME);
 
     char atm[PROPERTY_VALUE_MAX];

@@ -12,6 +12,7 @@
 #include "core/tolkd_log.h"
 #include "dispatch/bat_cmd.h"
 #include "dispatch/cmd_tables.h"
+#include "dispatch/command_line.h"
 #include "handlers/handlers.h"
 #include "serial/response_writer.h"
 #include "serial/serial_device.h"
@@ -33,15 +34,6 @@ int getCmdName(const char *line, char *out, int size) {
     return 0;
 }
 
-// The operation form of a const line. getAtOp may move its cursor, so it gets a
-// private copy; a command line never exceeds the 6144-byte line buffer.
-static AtOpType lineOp(const char *line) {
-    char copy[DATA_BUF_SIZE];
-    snprintf(copy, sizeof(copy), "%s", line);
-    char *cursor = copy;
-    return getAtOp(&cursor);
-}
-
 static const char *opMark(AtOpType op) {
     switch (op) {
     case AT_SET_OP: return "=";
@@ -51,20 +43,17 @@ static const char *opMark(AtOpType op) {
     }
 }
 
-int ril_command_hdlr(const char *line) {
-    char name[CMD_NAME_SIZE];
-    if (getCmdName(line, name, sizeof(name)) != 0) return 0;
-
+int ril_command_hdlr(const CommandLine *cmd) {
     const RilMmiCmd *row = NULL;
     for (int i = 0; i < RIL_MMI_CMD_COUNT; i++) {
-        if (strcmp(name, ril_mmi_cmd_table[i].cmdName) == 0) {
+        if (strcmp(cmd->name, ril_mmi_cmd_table[i].cmdName) == 0) {
             row = &ril_mmi_cmd_table[i];
             break;
         }
     }
     if (row == NULL) return 0;
 
-    AtOpType op = lineOp(line);
+    AtOpType op = cmd->op;
     LOGD("The cus mmi command op is 0x%x; Support op is 0x%x", (unsigned)op, row->supportOp);
     if (((unsigned)op & row->supportOp) == 0) {
         LOGD("This is a normal RIL AT command.");
@@ -87,51 +76,43 @@ int ril_command_hdlr(const char *line) {
 
     char *slot = q->cmd[q->EIdx];
     memset(slot, 0, MMI_CMD_TEXT_SIZE);
-    snprintf(slot, MMI_CMD_TEXT_SIZE, "%s%s%s", name, opMark(op), MMI_CMD_SUFFIX);
+    snprintf(slot, MMI_CMD_TEXT_SIZE, "%s%s%s", cmd->name, opMark(op), MMI_CMD_SUFFIX);
     q->EIdx = (q->EIdx + 1) % MMI_QUEUE_SIZE;
     return 1;
 }
 
 // With operator OP12 the +CMEC settings can take the keypad and touch screen
 // away from the AT side: a zero refuses the set form of AT+CKPD / AT+CTSA.
-static bool disabledByCmec(const char *name, const char *line) {
-    bool gated = (gCmecConfig[0] == 0 && strcmp(name, "AT+CKPD") == 0) ||
-                 (gCmecConfig[3] == 0 && strcmp(name, "AT+CTSA") == 0);
-    return gated && lineOp(line) == AT_SET_OP;
+static bool disabledByCmec(const CommandLine *cmd) {
+    bool gated = (gCmecConfig[0] == 0 && strcmp(cmd->name, "AT+CKPD") == 0) ||
+                 (gCmecConfig[3] == 0 && strcmp(cmd->name, "AT+CTSA") == 0);
+    return gated && cmd->op == AT_SET_OP;
 }
 
-int custom_command_hdlr(const char *line) {
-    char name[CMD_NAME_SIZE];
-    if (getCmdName(line, name, sizeof(name)) != 0) return 0;
-
+int custom_command_hdlr(const CommandLine *cmd) {
     char optr[PROPERTY_VALUE_MAX];
     property_get("persist.operator.optr", optr, "OM");
     if (strcmp(optr, "OP12") == 0) {
-        if (disabledByCmec(name, line)) {
+        if (disabledByCmec(cmd)) {
             LOGD("Disabled by +CMEC");
             writeDataToserialByResponseType(RESPONSE_ERROR);
             return 1;
         }
-    } else if (strcmp(name, "AT+CMEC") == 0) {
+    } else if (strcmp(cmd->name, "AT+CMEC") == 0) {
         // +CMEC is answered here only for OP12; elsewhere the modem answers it.
         return 0;
     }
 
     const CustomCmd *row = NULL;
     for (int i = 0; i < CUSTOM_CMD_COUNT; i++) {
-        if (strcmp(name, custom_cmd_table[i].cmdName) == 0) {
+        if (strcmp(cmd->name, custom_cmd_table[i].cmdName) == 0) {
             row = &custom_cmd_table[i];
             break;
         }
     }
     if (row == NULL) return 0;
 
-    // Handlers tokenize their own copy; this one only needs a cursor that getAtOp
-    // can move past "=".
-    char copy[DATA_BUF_SIZE];
-    snprintf(copy, sizeof(copy), "%s", line);
-    char *cursor = copy;
-    AtOpType op = getAtOp(&cursor);
+    AtOpType op = cmd->op;
     LOGD("The command op is %d; Support op is %d", op, (int)row->supportOp);
     if (((unsigned)op & row->supportOp) == 0) {
         writeDataToserialByResponseType(RESPONSE_NOT_IMPLEMENTED);
@@ -140,7 +121,7 @@ int custom_command_hdlr(const char *line) {
 
     char response[RESPONSE_BUF_SIZE];
     memset(response, 0, sizeof(response));
-    int result = row->handler(cursor != NULL ? cursor : "", op, response);
+    int result = row->handler(cmd->param, op, response);
     response[RESPONSE_BUF_SIZE - 1] = '\0';
     size_t len = strlen(response);
     if (len > 0) writeDataToSerial(response, (int)len);
@@ -158,10 +139,8 @@ static bool isPctSmsCommand(const char *name) {
     return false;
 }
 
-int generic_command_hdlr(const char *line) {
-    char name[CMD_NAME_SIZE];
-    if (getCmdName(line, name, sizeof(name)) != 0) return 0;
-
+int generic_command_hdlr(const CommandLine *cmd) {
+    const char *name = cmd->name;
     char pctMode[PROPERTY_VALUE_MAX];
     property_get("persist.service.pct.mode", pctMode, "1");
     LOGD("pct_mode is %s", pctMode);
@@ -183,7 +162,7 @@ int generic_command_hdlr(const char *line) {
     if (strcmp(name, "AT+VZWAPNE") != 0 && strcmp(name, "AT+VZWAPNETMR") != 0) return 1;
     // The APN settings go to the framework only while +VZWTOLKCFG leaves them
     // there; reads are always the modem's.
-    return (lineOp(line) == AT_SET_OP && gVzwTolkCfg != 1) ? 1 : 0;
+    return (cmd->op == AT_SET_OP && gVzwTolkCfg != 1) ? 1 : 0;
 }
 
 int audio_command_hdlr(const char *line) {
@@ -208,15 +187,15 @@ int belvo_audio_command_hdlr(const char *line) {
     return 0;
 }
 
-int process_cmd_line(const char *line) {
-    if (line == NULL) line = "";
+int dispatchCommandLine(const CommandLine *cmd) {
+    const char *line = cmd->text;
 
     LOGD("handle in custom_command_hdlr");
-    if (ril_command_hdlr(line)) return RIL_TYPE;
-    if (custom_command_hdlr(line)) return TOLK_TYPE;
+    if (ril_command_hdlr(cmd)) return RIL_TYPE;
+    if (custom_command_hdlr(cmd)) return TOLK_TYPE;
 
     LOGD("handle in generic_command_hdlr");
-    if (generic_command_hdlr(line)) return GENERIC_TYPE;
+    if (generic_command_hdlr(cmd)) return GENERIC_TYPE;
 
     LOGD("handle in audio_command_hdlr");
     switch (audio_command_hdlr(line)) {
@@ -233,4 +212,11 @@ int process_cmd_line(const char *line) {
 
     if (cit_test_check(line) >= 1) return BELVO_AUTIOCIT_TYPE;
     return RIL_TYPE;
+}
+
+int process_cmd_line(const char *line) {
+    // Parsing only reads the line; the record's pointer is not written through.
+    CommandLine cmd;
+    parseCommandLine(&cmd, const_cast<char *>(line != NULL ? line : ""), line != NULL ? (int)strlen(line) : 0, NULL);
+    return dispatchCommandLine(&cmd);
 }

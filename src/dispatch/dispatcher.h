@@ -3,14 +3,7 @@
 #ifndef TOLKD_DISPATCH_DISPATCHER_H
 #define TOLKD_DISPATCH_DISPATCHER_H
 
-#define RIL_TYPE 1
-#define AUDIO_TYPE 2
-#define TOLK_TYPE 4
-#define GENERIC_TYPE 5
-#define BAT_TYPE 6
-#define AUDIO_EXT_TYPE 7
-#define BELVO_AUDIO_TYPE 9
-#define BELVO_AUTIOCIT_TYPE 10
+#include "dispatch/command_type.h"
 
 #define CMD_NAME_SIZE 32
 #define RESPONSE_BUF_SIZE 2048
@@ -38,10 +31,15 @@ typedef struct DestCmd {
     int dest;
 } DestCmd;
 
+struct CommandLine;
+
+// The CommandType of a parsed command line; local commands are answered on the way.
+int dispatchCommandLine(const struct CommandLine *cmd);
+// The same for a line as it is (parsed here, origin the current line's link).
 int process_cmd_line(const char *line);
-int ril_command_hdlr(const char *line);
-int custom_command_hdlr(const char *line);
-int generic_command_hdlr(const char *line);
+int ril_command_hdlr(const struct CommandLine *cmd);
+int custom_command_hdlr(const struct CommandLine *cmd);
+int generic_command_hdlr(const struct CommandLine *cmd);
 int audio_command_hdlr(const char *line);
 int belvo_audio_command_hdlr(const char *line);
 

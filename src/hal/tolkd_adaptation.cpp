@@ -1,7 +1,8 @@
 // The radio HAL bridge: modem commands go out as HAL requests on the main thread;
 // the HAL's answers and unsolicited output arrive on HIDL runtime threads and are
-// written into the bridge's end of the modem socket pair, where the main loop reads
-// them like any other target link. The callbacks touch nothing else.
+// written, one record per callback, into the bridge's end of the modem socket pair,
+// where the main loop reads them. The callbacks touch nothing else. The bridge is
+// the lowest layer of the modem path: it answers nobody and judges nothing.
 #include "hal/tolkd_adaptation.h"
 #include "hal/tolkd_adaptation_impl.h"
 
@@ -15,10 +16,7 @@
 #include <cutils/properties.h>
 
 #include "core/prop_number.h"
-#include "core/reader.h"
 #include "core/tolkd_log.h"
-#include "serial/response_writer.h"
-#include "targets/target_relay.h"
 
 using android::sp;
 using android::wp;
@@ -33,12 +31,12 @@ TolkdAdaptation *gTolkdAdaptation = NULL;
 
 static const char *const kSlotInstances[TOLKD_SIM_SLOT_COUNT] = {"slot1", "slot2", "slot3", "slot4"};
 
-static const char kNoModem[] = "ERROR:No Modem";
-
 TolkdAdaptation::TolkdAdaptation() : mSocketFd(-1) {
     pthread_mutex_init(&mMutex, NULL);
-    mResponse = new TolkResponse(this);
-    mIndication = new TolkIndication(this);
+    for (int slot = 0; slot < TOLKD_SIM_SLOT_COUNT; slot++) {
+        mResponse[slot] = new TolkResponse(this, slot);
+        mIndication[slot] = new TolkIndication(this, slot);
+    }
     mDeathRecipient = new RadioDeathRecipient(this);
 }
 
@@ -70,15 +68,16 @@ void TolkdAdaptation::setUp(int slot) {
         LOGE("getService %s failed", kSlotInstances[slot]);
         return;
     }
-    mRadio[slot]->registerTolkCallbacks(mResponse, mIndication);
+    mRadio[slot]->registerTolkCallbacks(mResponse[slot], mIndication[slot]);
     mRadio[slot]->linkToDeath(mDeathRecipient, 0);
 }
 
-bool TolkdAdaptation::sendRequest(const char *data, int length) {
+bool TolkdAdaptation::sendRequest(const char *data, int length, int *slotOut) {
     if (data == NULL || length < 0) return false;
     LOGD("%.*s", length, data);
     pthread_mutex_lock(&mMutex);
     int slot = getSlotId();
+    if (slotOut != NULL) *slotOut = slot;
     if ((unsigned int)slot >= TOLKD_SIM_SLOT_COUNT) {
         pthread_mutex_unlock(&mMutex);
         return false;
@@ -98,30 +97,53 @@ bool TolkdAdaptation::sendRequest(const char *data, int length) {
     bool ok = status.isOk();
     if (!ok) {
         // Drop the broken proxy so the next request connects afresh.
-        mRadio[slot].clear();
+        dropProxy(slot);
     }
     pthread_mutex_unlock(&mMutex);
     return ok;
 }
 
-void TolkdAdaptation::sendResponse(const char *data, int length) {
-    if (data == NULL || length <= 0) return;
-    LOGD("%.*s", length, data);
-    pthread_mutex_lock(&mMutex);
-    // A short send would leave half an answer in the pair, so the rest follows;
-    // MSG_NOSIGNAL turns a closed main-loop end into a plain failure.
-    int sent = 0;
-    while (sent < length) {
-        ssize_t n = send(mSocketFd, data + sent, (size_t)(length - sent), MSG_NOSIGNAL);
+// Sends all of len bytes into fd; false when the pair failed.
+static bool sendWhole(int fd, const char *data, size_t len) {
+    size_t sent = 0;
+    while (sent < len) {
+        ssize_t n = send(fd, data + sent, len - sent, MSG_NOSIGNAL);
         if (n < 0) {
             if (errno == EINTR) continue;
-            if (sent == 0) sent = -1;
-            break;
+            return false;
         }
-        sent += (int)n;
+        sent += (size_t)n;
     }
-    LOGD("sendLen = %d", sent);
+    return true;
+}
+
+void TolkdAdaptation::sendResponse(int kind, int slot, const char *data, int length) {
+    if (length < 0 || (length > 0 && data == NULL)) return;
+    LOGD("%.*s", length, data != NULL ? data : "");
+    ModemRecordHeader header;
+    memset(&header, 0, sizeof(header));
+    header.kind = (uint8_t)kind;
+    header.slot = (uint8_t)slot;
+    header.length = (uint32_t)length;
+    pthread_mutex_lock(&mMutex);
+    // Header and data under one lock hold, partial sends completed: a record is
+    // never cut by another thread's record. MSG_NOSIGNAL turns a closed main-loop
+    // end into a plain failure.
+    bool ok = sendWhole(mSocketFd, (const char *)&header, sizeof(header)) &&
+              (length == 0 || sendWhole(mSocketFd, data, (size_t)length));
+    LOGD("sendLen = %d", ok ? length : -1);
     pthread_mutex_unlock(&mMutex);
+}
+
+void TolkdAdaptation::dropProxy(int slot) {
+    mRadio[slot].clear();
+    // The answers still due from this proxy will not come; the main loop learns it
+    // behind the answers that did come, which are already in the pair.
+    ModemRecordHeader header;
+    memset(&header, 0, sizeof(header));
+    header.kind = MODEM_RECORD_SLOT_LOST;
+    header.slot = (uint8_t)slot;
+    if (!sendWhole(mSocketFd, (const char *)&header, sizeof(header))) LOGE("slot %d lost, not reported", slot);
 }
 
 void TolkdAdaptation::serviceDied(const android::hidl::base::V1_0::IBase *who) {
@@ -131,7 +153,7 @@ void TolkdAdaptation::serviceDied(const android::hidl::base::V1_0::IBase *who) {
     // failed send already replaced; the fresh proxy and the answers on it stay.
     for (int i = 0; i < TOLKD_SIM_SLOT_COUNT; i++) {
         if (mRadio[i] != nullptr && static_cast<android::hidl::base::V1_0::IBase *>(mRadio[i].get()) == who) {
-            mRadio[i].clear();
+            dropProxy(i);
         }
     }
     pthread_mutex_unlock(&mMutex);
@@ -150,13 +172,13 @@ void TolkdAdaptation::setSocketFd(int fd) {
 
 Return<void> TolkResponse::sendTolkResponse(const RadioResponseInfo &, const hidl_vec<uint8_t> &data) {
     LOGD("%.*s, %lu", (int)data.size(), (const char *)data.data(), (unsigned long)data.size());
-    mAdaptation->sendResponse((const char *)data.data(), (int)data.size());
+    mAdaptation->sendResponse(MODEM_RECORD_ANSWER, mSlot, (const char *)data.data(), (int)data.size());
     return Void();
 }
 
 Return<void> TolkIndication::tolkInd(RadioIndicationType, const hidl_vec<uint8_t> &data) {
     LOGD("%.*s, %lu", (int)data.size(), (const char *)data.data(), (unsigned long)data.size());
-    mAdaptation->sendResponse((const char *)data.data(), (int)data.size());
+    mAdaptation->sendResponse(MODEM_RECORD_INDICATION, mSlot, (const char *)data.data(), (int)data.size());
     return Void();
 }
 
@@ -177,20 +199,8 @@ void setSocketFdForAdaptation(int fd) { getAdaptation()->setSocketFd(fd); }
 
 bool sendRequest(const char *data, int length) { return getAdaptation()->sendRequest(data, length); }
 
-int sendDataToRild(const char *line) {
-    LOGD("Enter");
-    if (line == NULL) return 0;
-    if (!sendRequest(line, (int)strlen(line) + 1)) writeDataToSerial(kNoModem, (int)sizeof(kNoModem));
-    isATCmdInject = true;
-    LOGD(" send data over");
-    for (const char *p = line; *p != '\0'; p++) {
-        if (*p == 0x1A || *p == 0x1B) {
-            LOGD(" SUB or ESC in line, clear isMsgCmdInput");
-            isMsgCmdInput = false;
-            break;
-        }
-    }
-    return 0;
+bool sendRequestOnSlot(const char *data, int length, int *slot) {
+    return getAdaptation()->sendRequest(data, length, slot);
 }
 
 void sigpipe_handler(int) { LOGE("Caught SIGPIPE\n"); }

@@ -51,14 +51,14 @@ static WaitResult waitWritable(int fd, struct timeval *timeout, bool *stillMarke
     return WAIT_NOT_YET;
 }
 
-// Reopens the serial port after a fatal write error and puts it back into the MMI
-// test options. Ends the process when the port cannot be restored.
+// Reopens the serial port after a fatal write error; the open puts it into the
+// settings of the mode it was in (MMI test or line settings). Ends the process
+// when the port cannot be restored.
 static int reopenSerialPort(void) {
     for (int i = 0; i < AUDIO_REOPEN_TRIES; i++) {
         const int fd = open_serial_device(&gSerialDevice, gSerialDevice.devName[DEVICE_SERIAL]);
         gSerialDevice.fd[DEVICE_SERIAL] = fd;
         if (fd >= 0) {
-            setMMITESTOption(1);
             LOGD("The FD is reopen successfully");
             return fd;
         }
@@ -68,13 +68,18 @@ static int reopenSerialPort(void) {
 }
 
 void writeDataToSerialByAudioType(const char *buf, int len) {
+    HostLink current = currentHostLink();
+    writeDataToLinkByAudioType(&current, buf, len);
+}
+
+void writeDataToLinkByAudioType(const HostLink *to, const char *buf, int len) {
     if (buf == NULL || len <= 0) return;
     for (int i = 0; i < len; i++) {
         LOGD("input[%d]=%x", i, (unsigned)(unsigned char)buf[i]);
     }
 
-    const int device = currentOutputDevice();
-    int fd = gSerialDevice.fd[device];
+    const int device = to != NULL ? to->device : currentOutputDevice();
+    int fd = hostLinkFd(to);
     if (fd < 0) return;
 
     int done = 0;

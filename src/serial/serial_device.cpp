@@ -11,10 +11,11 @@
 #include <unistd.h>
 
 #include "core/tolkd_log.h"
-#include "targets/mmi_queue.h"
 
 SerialDevice gSerialDevice;
 struct termios last_deviceOptions;
+unsigned gAdbConnection = 0;
+bool gMmiSettingsInForce = false;
 
 // Output post-processing bits the daemon always clears, so answers leave unchanged:
 // OPOST | OLCUC | OCRNL | ONOCR | ONLRET.
@@ -35,17 +36,44 @@ int currentOutputDevice(void) {
     return (cur == DEVICE_ADB_LISTEN || cur == DEVICE_ADB) ? DEVICE_ADB : DEVICE_SERIAL;
 }
 
+HostLink currentHostLink(void) {
+    HostLink link;
+    link.device = currentOutputDevice();
+    link.connection = gAdbConnection;
+    return link;
+}
+
+int hostLinkFd(const HostLink *link) {
+    if (link == NULL) return gSerialDevice.fd[currentOutputDevice()];
+    if (link->device == DEVICE_ADB) {
+        // The host that asked has hung up; a later connection is another host.
+        if (link->connection != gAdbConnection) return -1;
+        return gSerialDevice.fd[DEVICE_ADB];
+    }
+    return gSerialDevice.fd[DEVICE_SERIAL];
+}
+
 void initSerialDevice(SerialDevice *dev) {
     LOGD("Enter");
     if (dev == NULL) return;
     memset(dev, 0, sizeof(*dev));
-    mmiCmdSeqReset();
     dev->fd[DEVICE_SERIAL] = -1;
     dev->fd[DEVICE_ADB_LISTEN] = -1;
     dev->fd[DEVICE_ADB] = -1;
     dev->echoOption[DEVICE_SERIAL] = 1;
     dev->echoOption[DEVICE_ADB_LISTEN] = 1;
     dev->cmdLen = 0;
+}
+
+// The MMI test set on top of the settings in t: no input processing (frames are
+// bytes, not text), output unchanged, canonical lines without echo, and neither an
+// erase nor a kill character, so that no byte of a frame edits or discards it.
+static void applyMmiSet(struct termios *t) {
+    t->c_iflag = 0;
+    t->c_oflag &= ~(tcflag_t)OFLAG_CLEAR_MASK;
+    t->c_lflag = ICANON;
+    t->c_cc[VERASE] = 0;
+    t->c_cc[VKILL] = _POSIX_VDISABLE;
 }
 
 int open_serial_device(SerialDevice *dev, const char *path) {
@@ -110,6 +138,13 @@ int open_serial_device(SerialDevice *dev, const char *path) {
     // reopen, queued input flushed), and would cut a line short anywhere else.
     options.c_cc[VEOF] = _POSIX_VDISABLE;
 
+    // A port reopened while the MMI test runs (a replug, a failed read or write)
+    // must stay in its settings: in the line settings a frame would be echoed and
+    // edited. The restore at the end of the test brings back the line settings
+    // saved when it began (a port that was not replugged still holds the MMI
+    // input settings, which are no line settings to go back to).
+    if (gMmiSettingsInForce && haveSettings) applyMmiSet(&options);
+
     (void)tcflush(fd, TCIFLUSH);
     // Never apply a record that was not read from the port: on a terminal an
     // all-zero record would drop the line speed and the receiver.
@@ -133,7 +168,8 @@ int setEchoOption(int on) {
     // Recorded even where the link is no terminal, so a later reopen honours it.
     gSerialDevice.echoOption[cur] = on;
 
-    (void)tcflush(fd, TCIFLUSH);
+    // TCSANOW, and no flush: a command the host typed right behind ATE0 is
+    // already waiting in the port and must still be read.
     if (!haveSettings) return -1;
     return tcsetattr(fd, TCSANOW, &options);
 }
@@ -156,11 +192,8 @@ void setMMITESTOption(int enable) {
         // so a later restore on the serial port never applies garbage.
         if (haveSettings) {
             last_deviceOptions = options;
-            options.c_iflag = 0;
-            options.c_oflag &= ~(tcflag_t)OFLAG_CLEAR_MASK;
-            options.c_lflag = ICANON;
-            options.c_cc[VERASE] = 0;
-            (void)tcsetattr(fd, TCSANOW, &options);
+            applyMmiSet(&options);
+            if (tcsetattr(fd, TCSANOW, &options) == 0 && cur == DEVICE_SERIAL) gMmiSettingsInForce = true;
         }
         LOGI("%s:%d for device:%d, deviceOptions[lflag=0x%x][iflag=0x%x][oflag=0x%x]", "setMMITESTOption", 1, cur,
              (unsigned)last_deviceOptions.c_lflag, (unsigned)last_deviceOptions.c_iflag,
@@ -174,8 +207,9 @@ void setMMITESTOption(int enable) {
     (void)tcflush(fd, TCIFLUSH);
     // Without a matching enable nothing was saved; an all-zero record would switch
     // off the port's receiver and line speed.
-    if (!isEmptySettings(&last_deviceOptions)) {
-        (void)tcsetattr(fd, TCSANOW, &last_deviceOptions);
+    if (!isEmptySettings(&last_deviceOptions) && tcsetattr(fd, TCSANOW, &last_deviceOptions) == 0 &&
+        cur == DEVICE_SERIAL) {
+        gMmiSettingsInForce = false;
     }
     LOGI("%s:%d for device:%d, last_deviceOptions[lflag=0x%x][iflag=0x%x][oflag=0x%x]", "setMMITESTOption", 0, cur,
          (unsigned)last_deviceOptions.c_lflag, (unsigned)last_deviceOptions.c_iflag,

@@ -8,7 +8,7 @@
 #include <string.h>
 
 #include "core/tolkd_log.h"
-#include "dispatch/dispatcher.h"
+#include "dispatch/command_type.h"
 #include "targets/target_conn.h"
 #include "targets/target_relay.h"
 
@@ -70,6 +70,25 @@ bool mmiCmdSeqDeQueue(void) {
         }
     }
     return matched;
+}
+
+void mmiCmdSeqForget(int count) {
+    if (count <= 0) return;
+    gMmiCmdSeq.idx = gMmiCmdSeq.idx > count ? gMmiCmdSeq.idx - count : 0;
+    // The answers lost are those of the oldest outstanding commands: a queued
+    // command whose countdown lies within them will never be answered; the later
+    // ones have that many fewer answers to wait for.
+    int i = validIndex(gMmiCmdSeq.deSeqIdx);
+    for (int visited = 0; visited < MMI_QUEUE_SIZE && gMmiCmdSeq.seq[i] >= 1; visited++, i = nextIndex(i)) {
+        if (gMmiCmdSeq.seq[i] <= count) {
+            LOGW("MMI command %s will get no answer", gMmiCmdSeq.cmd[validIndex(gMmiCmdSeq.SIdx)]);
+            gMmiCmdSeq.seq[i] = -1;
+            gMmiCmdSeq.deSeqIdx = nextIndex(gMmiCmdSeq.deSeqIdx);
+            gMmiCmdSeq.SIdx = nextIndex(validIndex(gMmiCmdSeq.SIdx));
+        } else {
+            gMmiCmdSeq.seq[i] -= count;
+        }
+    }
 }
 
 void sendCusMMICmdRspToMMI(const char *rsp) {

@@ -12,8 +12,9 @@
 
 #include "core/prop_number.h"
 #include "core/tolkd_log.h"
-#include "dispatch/dispatcher.h"
+#include "dispatch/command_type.h"
 #include "hal/tolkd_adaptation.h"
+#include "targets/modem_link.h"
 
 int s_fdRild_command = -1;
 int s_fdService_command = -1;
@@ -32,6 +33,8 @@ void connectTarget(int target) {
             break;
         }
         s_fdRild_command = fds[0];
+        // A record half read from the old pair is lost with it.
+        modemLinkReset();
         // The bridge closes the end of the previous pair it held, if any.
         setSocketFdForAdaptation(fds[1]);
         break;

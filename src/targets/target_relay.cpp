@@ -1,5 +1,7 @@
 // Sends forwarded commands to the generic service and the audio links, and relays
-// whatever a target answers to the host unchanged: one receive is one relay.
+// what the audio links answer. The modem pair and the generic service link, which
+// answer asynchronously, have readers of their own (modem_link.cpp,
+// generic_link.cpp); readDataFromTarget serves any of them.
 #include "targets/target_relay.h"
 
 #include <errno.h>
@@ -10,22 +12,44 @@
 #include <sys/types.h>
 #include <unistd.h>
 
-#include "core/reader.h"
 #include "core/tolkd_log.h"
-#include "dispatch/dispatcher.h"
+#include "dispatch/command_type.h"
 #include "serial/response_writer.h"
 #include "serial/serial_device.h"
-#include "targets/mmi_queue.h"
+#include "targets/answer_queue.h"
+#include "targets/generic_link.h"
+#include "targets/modem_link.h"
 #include "targets/target_conn.h"
 
 bool isATCmdInject = false;
 
 static const char kUeNotReady[] = "ERROR:UE is not ready";
 
+// How an audio answer goes to the host: the device maker's answers through the
+// raw writer that waits and retries, "AUD"/"MM" answers as they are, any other
+// answer as framed text.
+enum RelayForm { RELAY_DEVICE_MAKER, RELAY_RAW, RELAY_TEXT };
+
+// The last answer of each audio link: its link and its form, so that bytes of it
+// that come after its piece wait follow it there.
+struct AudioAnswer {
+    bool valid;
+    HostLink to;
+    RelayForm form;
+};
+static AudioAnswer lastAudio[2];  // tolk-audio, rild-tolk-md2
+
 static void closeLink(int *fd) {
     int rc = close(*fd);
     *fd = -1;
     (void)rc;
+}
+
+bool reportUeNotReady(void) {
+    if (!isATCmdInject) return false;
+    isATCmdInject = false;
+    writeDataToSerial(kUeNotReady, (int)sizeof(kUeNotReady));
+    return true;
 }
 
 // Receives into buf, retrying interrupted receives. Returns the byte count, 0 when
@@ -54,64 +78,31 @@ static int waitReadable(int fd) {
     return 0;
 }
 
-// How one received piece goes to the host. The first piece of an answer is judged
-// by its content (the text writer passes "AUD..."/"MM..." answers raw and frames the
-// rest); the later pieces of an answer longer than one receive go out the way the
-// first did, since a binary tail carries no prefix of its own.
-enum RelayForm { RELAY_BY_CONTENT, RELAY_RAW, RELAY_TEXT };
-
-// Receives one piece from a target and relays it. Returns the writer's result or the
-// result of closing; *used, when given, tells how the piece went out.
-static int relayFromTarget(int target, int *fd, RelayForm form, RelayForm *used) {
-    if (fd == NULL) return -1;
-    char buf[DATA_BUF_SIZE];
-    LOGD("Read data from target:%d with fd:%d", target, *fd);
-    memset(buf, 0, sizeof(buf));
-
-    ssize_t n = receiveFromTarget(*fd, buf, MAX_DATA_LEN);
-    if (n < 0) {
-        LOGE("fail to receive data from target socket. errno = %d", errno);
-        closeLink(fd);
-        return -1;
-    }
-    if (n == 0) {
-        LOGD("The peer has performed an orderly shutdown, isATCmdInject %d", isATCmdInject);
-        closeLink(fd);
-        if (isATCmdInject) {
-            isATCmdInject = false;
-            return writeDataToSerial(kUeNotReady, (int)sizeof(kUeNotReady));
-        }
-        return 0;
-    }
-
-    if (target == RIL_TYPE) {
-        // Every receive counts as one modem answer, whatever it holds.
-        LOGD("Receive RIL rsp = [%d]", gMmiCmdSeq.idx);
-        gMmiCmdSeq.idx--;
-        if (mmiCmdSeqDeQueue()) sendCusMMICmdRspToMMI(buf);
-    }
-
-    isATCmdInject = false;
-    LOGD("data receive from %d is %s", target, buf);
-    LOGD("data receive data length is %d", (int)n);
-
-    int result = 0;
-    if (target == BELVO_AUDIO_TYPE) {
-        writeDataToSerialByAudioType(buf, (int)n);
-        form = RELAY_RAW;
-    } else if (form == RELAY_RAW) {
-        result = writeRawDataToSerial(buf, (int)n);
-    } else {
-        result = writeDataToSerial(buf, (int)n);
-        form = isAudioResponse(buf, (int)n) ? RELAY_RAW : RELAY_TEXT;
-    }
-    if (used != NULL) *used = form;
-
-    if (isFinalResult(buf, (int)n)) isMsgCmdInput = false;
-    return result;
+// Waits at most the piece wait for more bytes of an answer on fd.
+static bool pieceArrives(int fd) {
+    struct pollfd p = {fd, POLLIN, 0};
+    int rc;
+    do {
+        rc = poll(&p, 1, ANSWER_PIECE_WAIT_MS);
+    } while (rc < 0 && errno == EINTR);
+    return rc > 0 && (p.revents & (POLLIN | POLLHUP | POLLERR)) != 0;
 }
 
-int readDataFromTarget(int target, int *fd) { return relayFromTarget(target, fd, RELAY_BY_CONTENT, NULL); }
+int readDataFromTarget(int target, int *fd) {
+    if (fd == NULL) return -1;
+    switch (target) {
+    case RIL_TYPE:
+        serveModemLink();
+        return 0;
+    case GENERIC_TYPE:
+        serveGenericLink();
+        return 0;
+    default:
+        // The audio links are read only while their answer is awaited.
+        audioReaderLoop(target);
+        return 0;
+    }
+}
 
 int readDataFromTargetWithResult(int target, int *fd, char *buf, int size) {
     if (fd == NULL || buf == NULL || size < 2) return -1;
@@ -136,30 +127,13 @@ int readDataFromTargetWithResult(int target, int *fd, char *buf, int size) {
 
 void serviceReaderLoop(void) {
     if (s_fdService_command == -1) return;
-    int rc = waitReadable(s_fdService_command);
-    if (rc < 0) {
-        LOGE("Fail to select in serviceReaderLoop. error: %d", errno);
-        closeLink(&s_fdService_command);
-        return;
-    }
-    if (rc == 0) return;
-    LOGD("Prepare read the data from generic service");
-    readDataFromTarget(GENERIC_TYPE, &s_fdService_command);
+    genericLinkAwaitAnswer(NULL, 0, true);
 }
 
 int serviceReaderLoopWithResult(const char *cmd) {
     (void)cmd;
-    if (s_fdService_command == -1) return -1;
-    int rc = waitReadable(s_fdService_command);
-    if (rc < 0) {
-        LOGE("Fail to select in serviceReaderLoop. error: %d", errno);
-        closeLink(&s_fdService_command);
-        return -1;
-    }
-    if (rc == 0) return -1;
-    LOGD("Prepare read the data from generic service");
     char buf[DATA_BUF_SIZE];
-    readDataFromTargetWithResult(GENERIC_TYPE, &s_fdService_command, buf, (int)sizeof(buf));
+    if (genericLinkAwaitAnswer(buf, (int)sizeof(buf), true) < 0) return -1;
     return strstr(buf, "OK") != NULL ? 1 : -1;
 }
 
@@ -173,6 +147,16 @@ static int *audioLink(int target) {
         return &s_fdAudioExt_command;
     default:
         return NULL;
+    }
+}
+
+static AudioAnswer *lastAnswerOf(int target) { return &lastAudio[target == AUDIO_EXT_TYPE ? 1 : 0]; }
+
+static void relayRawPiece(RelayForm form, const HostLink *to, const char *data, int len) {
+    if (form == RELAY_DEVICE_MAKER) {
+        writeDataToLinkByAudioType(to, data, len);
+    } else {
+        writeRawDataToLink(to, data, len);
     }
 }
 
@@ -195,48 +179,103 @@ void audioReaderLoop(int target) {
     }
     if (rc == 0) return;
     LOGD("Prepare read the data from audio driver");
-    RelayForm form = RELAY_BY_CONTENT;
-    relayFromTarget(target, fd, RELAY_BY_CONTENT, &form);
-    // An answer longer than one read is already waiting in full: relay the rest
-    // now, piece by piece and in the first piece's form, rather than leave it to be
-    // dropped before the next command.
-    while (*fd >= 0) {
-        struct pollfd p = {*fd, POLLIN, 0};
-        if (poll(&p, 1, 0) != 1 || (p.revents & POLLIN) == 0) break;
-        relayFromTarget(target, fd, form, &form);
+
+    // An answer may reach the daemon in several pieces. Raw answers go out piece
+    // by piece as they come; a text answer is put together up to its final result
+    // line and framed once. The answer is over at its final result line, or when
+    // no further piece comes within the piece wait.
+    HostLink to = currentHostLink();
+    AnswerPieces pieces;
+    answerPiecesReset(&pieces);
+    char buf[DATA_BUF_SIZE];
+    int len = 0;
+    bool first = true;
+    RelayForm form = RELAY_TEXT;
+    for (;;) {
+        ssize_t n = receiveFromTarget(*fd, buf + len, (size_t)(MAX_DATA_LEN - len));
+        if (n < 0) {
+            LOGE("fail to receive data from target socket. errno = %d", errno);
+            closeLink(fd);
+            break;
+        }
+        if (n == 0) {
+            LOGD("The peer has performed an orderly shutdown, isATCmdInject %d", isATCmdInject);
+            closeLink(fd);
+            reportUeNotReady();
+            break;
+        }
+        isATCmdInject = false;
+        LOGD("data receive from %d is %.*s", target, (int)n, buf + len);
+        LOGD("data receive data length is %d", (int)n);
+        if (first) {
+            form = target == BELVO_AUDIO_TYPE ? RELAY_DEVICE_MAKER
+                   : isAudioResponse(buf, (int)n) ? RELAY_RAW
+                                                   : RELAY_TEXT;
+            first = false;
+        }
+        if (form != RELAY_TEXT) {
+            relayRawPiece(form, &to, buf, (int)n);
+        } else {
+            len += (int)n;
+            if (finalResultEnd(buf, len) > 0) break;
+            if (len == MAX_DATA_LEN) {
+                writeAnswerPiece(&to, &pieces, buf, len, false);
+                len = 0;
+            }
+        }
+        if (!pieceArrives(*fd)) break;
     }
+    if (first) return;
+    if (form == RELAY_TEXT) writeAnswerPiece(&to, &pieces, buf, len, true);
+    AudioAnswer *last = lastAnswerOf(target);
+    last->valid = true;
+    last->to = to;
+    last->form = form;
 }
 
 int sendDataToGenericService(const char *data) {
     if (data == NULL) return 0;
+    // Answers that have come meanwhile go out first, to the links that asked.
+    genericLinkDrain();
     size_t len = strlen(data);
     // MSG_NOSIGNAL: a vanished service is a lost send, not a signal.
-    ssize_t n = send(s_fdService_command, data, len, MSG_NOSIGNAL);
-    if (n < 0 || (size_t)n < len) LOGE("lose data when send to generic service. errno = %d", errno);
+    ssize_t n = s_fdService_command >= 0 ? send(s_fdService_command, data, len, MSG_NOSIGNAL) : -1;
+    if (n < 0 || (size_t)n < len) {
+        LOGE("lose data when send to generic service. errno = %d", errno);
+        // A link that takes no command is broken; the next command connects anew.
+        if (s_fdService_command >= 0) {
+            genericLinkClosed();
+            closeLink(&s_fdService_command);
+        }
+        return -1;
+    }
     return 0;
 }
 
-// An answer longer than one read leaves its tail on the link, where it would be
-// taken for the answer to the next command, and the one after. Nothing else is
-// ever waiting on an audio link before a command goes out (its answer is read
-// before the main loop goes on), so whatever is there now is stale. Returns false
-// when the link has ended (the service restarted): a command sent into it would
-// never be answered.
-static bool dropStaleAudioBytes(int fd) {
-    char scratch[1024];
-    unsigned long dropped = 0;
+// Bytes on an audio link before a command goes out came after the piece wait of
+// the previous answer ended: they are its late rest and follow it, in its form,
+// to its link. Returns false when the link has ended (the service restarted): a
+// command sent into it would never be answered.
+static bool relayLateAudioBytes(int fd, int target) {
+    char buf[MAX_DATA_LEN];
+    const AudioAnswer *last = lastAnswerOf(target);
     bool alive = true;
     for (;;) {
-        ssize_t n = recv(fd, scratch, sizeof(scratch), MSG_DONTWAIT);
+        ssize_t n = recv(fd, buf, sizeof(buf), MSG_DONTWAIT);
         if (n < 0 && errno == EINTR) continue;
         if (n > 0) {
-            dropped += (unsigned long)n;
+            LOGW("%d bytes of the previous audio answer came late", (int)n);
+            if (!last->valid) continue;
+            if (last->form == RELAY_TEXT) {
+                writeDataToLink(&last->to, buf, (int)n);
+            } else {
+                relayRawPiece(last->form, &last->to, buf, (int)n);
+            }
             continue;
         }
         alive = n < 0 && (errno == EAGAIN || errno == EWOULDBLOCK);
         break;
     }
-    if (dropped > 0) LOGW("dropped %lu stale bytes from the audio link", dropped);
     return alive;
 }
 
@@ -251,7 +290,7 @@ int sendDataToAudio(const char *data, int len, int target) {
         return 0;
     }
     if (data == NULL || len < 0) len = 0;
-    if (!dropStaleAudioBytes(*fd)) {
+    if (!relayLateAudioBytes(*fd, target)) {
         LOGW("audio link %d has ended, connecting again", *fd);
         closeLink(fd);
         connectTarget(target);

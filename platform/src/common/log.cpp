@@ -1,9 +1,10 @@
 // The Android log on the host: logcat "threadtime" lines written to a file or stderr.
 //
-// The filter is checked before anything is formatted, because debug lines are
-// frequent and normally filtered out. Callers come from the main thread and from
-// radio HAL callback threads alike, so all state sits behind one mutex and every
-// call ends in a single write() per destination, which keeps lines whole.
+// The filter is checked before anything else, because debug lines are frequent
+// and normally filtered out: a suppressed line costs two comparisons. Callers come
+// from the main thread and from radio HAL callback threads alike; the filter is
+// read once and never changes, the destination sits behind one mutex, and every
+// written line ends in a single write() per destination, which keeps lines whole.
 #include <android/log.h>
 #include <tolk_platform/device_root.h>
 #include <tolk_platform/file_util.h>
@@ -21,12 +22,11 @@
 #include <time.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <atomic>
 #include <mutex>
 #include <string>
 #include <vector>
-
-extern char **environ;
 
 namespace {
 
@@ -39,20 +39,18 @@ struct TagRule {
     int level;
 };
 
+// The filter of ANDROID_LOG_TAGS, read once: a process sets its log filter before
+// it starts (init, or tolk-sim for the daemon), never while it runs.
+struct Filter {
+    int defaultLevel = kDefaultLevel;
+    std::vector<TagRule> rules;
+    int lowest = kDefaultLevel;  // below this level no tag is written
+};
+
 struct LogState {
     // Recursive: a signal handler that logs while this thread is inside a write
     // (SIGPIPE from a stderr pipe whose reader is gone) must not deadlock.
     std::recursive_mutex mutex;
-    bool filterParsed = false;
-    std::string filterEnv;  // ANDROID_LOG_TAGS as last parsed
-    // The environment as it was when the filter was parsed (see filter_current).
-    char **envArray = nullptr;
-    size_t envCount = 0;
-    const char *envLast = nullptr;
-    const char *tagsEntry = nullptr;  // the "ANDROID_LOG_TAGS=..." entry, if any
-    size_t tagsIndex = 0;
-    int defaultLevel = kDefaultLevel;
-    std::vector<TagRule> rules;
     int fd = -1;            // the file destination; -1 for stderr
     std::string destPath;   // what fd was opened for ("" = stderr)
 };
@@ -77,11 +75,10 @@ int level_of(char c) {
 
 // logcat filter syntax: blank-separated "TAG:LEVEL" items, "*" for every other tag,
 // a TAG without ":LEVEL" meaning verbose. Items with an unknown level are ignored.
-void parse_filter(LogState &s, const char *env) {
-    s.filterEnv = env != nullptr ? env : "";
-    s.defaultLevel = kDefaultLevel;
-    s.rules.clear();
-    const char *p = s.filterEnv.c_str();
+Filter *parse_filter(const char *env) {
+    Filter *f = new Filter;  // never destroyed: threads may log during exit
+    std::string text = env != nullptr ? env : "";
+    const char *p = text.c_str();
     while (*p != '\0') {
         while (*p != '\0' && isspace(static_cast<unsigned char>(*p))) p++;
         const char *start = p;
@@ -98,56 +95,28 @@ void parse_filter(LogState &s, const char *env) {
             if (level < 0) continue;
         }
         if (tag.empty()) continue;
-        if (tag == "*") s.defaultLevel = level;
-        else s.rules.push_back({tag, level});
+        if (tag == "*") f->defaultLevel = level;
+        else f->rules.push_back({tag, level});
     }
-    s.filterParsed = true;
+    f->lowest = f->defaultLevel;
+    for (const TagRule &r : f->rules) f->lowest = std::min(f->lowest, r.level);
+    return f;
 }
 
-constexpr char kTagsPrefix[] = "ANDROID_LOG_TAGS=";
-constexpr size_t kTagsPrefixLen = sizeof(kTagsPrefix) - 1;
-
-// Whether the parsed filter still matches ANDROID_LOG_TAGS. The daemon calls the
-// logger dozens of times per command, nearly all of them filtered out, and a
-// getenv() per call (a string compare per environment variable) was most of what
-// a filtered call cost. So the filter is re-read only when the environment may
-// have changed. setenv, unsetenv and putenv keep or move the environ array; within
-// one array, adding a variable fills the slot after the last one, removing one
-// moves the last entry down, and replacing ours changes its pointer; an edit of our
-// entry's text in place is caught by comparing the text. (Only clearenv() could
-// free the array and let a smaller one take its address; nothing here calls it.)
-bool filter_current(const LogState &s) {
-    if (!s.filterParsed || environ == nullptr || environ != s.envArray) return false;
-    if (environ[s.envCount] != nullptr) return false;
-    if (s.envCount > 0 && environ[s.envCount - 1] != s.envLast) return false;
-    if (s.tagsEntry == nullptr) return true;
-    return environ[s.tagsIndex] == s.tagsEntry && strcmp(s.tagsEntry + kTagsPrefixLen, s.filterEnv.c_str()) == 0;
+// The daemon calls the logger dozens of times per command, nearly all of them
+// below the filter; such a call must cost a comparison, not a getenv() (a string
+// compare per environment variable) and a lock. The filter never changes after
+// the first call, so it is read then and only read afterwards.
+const Filter &filter() {
+    static const Filter *f = parse_filter(getenv("ANDROID_LOG_TAGS"));
+    return *f;
 }
 
-void reread_filter(LogState &s) {
-    s.envArray = environ;
-    s.envCount = 0;
-    s.envLast = nullptr;
-    s.tagsEntry = nullptr;
-    s.tagsIndex = 0;
-    if (environ != nullptr) {
-        for (; environ[s.envCount] != nullptr; s.envCount++) {
-            if (s.tagsEntry == nullptr && strncmp(environ[s.envCount], kTagsPrefix, kTagsPrefixLen) == 0) {
-                s.tagsEntry = environ[s.envCount];
-                s.tagsIndex = s.envCount;
-            }
-        }
-        if (s.envCount > 0) s.envLast = environ[s.envCount - 1];
-    }
-    parse_filter(s, s.tagsEntry != nullptr ? s.tagsEntry + kTagsPrefixLen : nullptr);
-}
-
-int min_level(LogState &s, const char *tag) {
-    if (!filter_current(s)) reread_filter(s);
+int min_level(const Filter &f, const char *tag) {
     // The last rule for a tag wins, as when logcat applies them in order.
-    for (auto it = s.rules.rbegin(); it != s.rules.rend(); ++it)
-        if (it->tag == tag) return it->level;
-    return s.defaultLevel;
+    for (auto it = f.rules.rbegin(); it != f.rules.rend(); ++it)
+        if (strcmp(it->tag.c_str(), tag) == 0) return it->level;
+    return f.defaultLevel;
 }
 
 char prio_char(int prio) {
@@ -162,17 +131,37 @@ char prio_char(int prio) {
     }
 }
 
-// Where lines go now; "" means stderr.
+// Where the lines go, set by the process's starter (tolk-sim for the daemon) and
+// read once, like the filter: two getenv() calls per written line were a quarter
+// of what a command cost.
+struct Destination {
+    const char *file;  // TOLKD_LOG, or NULL: the device root decides
+    bool alsoStderr;   // TOLKD_LOG_STDERR=1
+};
+
+const Destination &configured() {
+    static const Destination d = [] {
+        const char *file = getenv("TOLKD_LOG");
+        const char *toStderr = getenv("TOLKD_LOG_STDERR");
+        Destination r;
+        r.file = file != nullptr && file[0] != '\0' ? strdup(file) : nullptr;  // kept for the process
+        r.alsoStderr = toStderr != nullptr && strcmp(toStderr, "1") == 0;
+        return r;
+    }();
+    return d;
+}
+
+// Where lines go now; "" means stderr. Without TOLKD_LOG they follow the device
+// root, which tests move between cases.
 std::string destination() {
-    const char *file = getenv("TOLKD_LOG");
-    if (file != nullptr && file[0] != '\0') return file;
+    const Destination &d = configured();
+    if (d.file != nullptr) return d.file;
     const char *root = tolk_device_root();
     if (root != nullptr) return std::string(root) + "/log/tolkd.log";
     return "";
 }
 
-// The descriptor for dest, reopened when the destination changed (tests move the
-// root between cases); -1 means stderr.
+// The descriptor for dest, reopened when the destination changed; -1 means stderr.
 int dest_fd(LogState &s, const std::string &dest) {
     if (s.fd >= 0 && dest == s.destPath) return s.fd;
     if (s.fd >= 0) close(s.fd);
@@ -184,6 +173,14 @@ int dest_fd(LogState &s, const std::string &dest) {
     s.fd = openat(AT_FDCWD, dest.c_str(), O_WRONLY | O_CREAT | O_APPEND | O_CLOEXEC, 0644);
     if (s.fd < 0) s.destPath.clear();
     return s.fd;
+}
+
+// The descriptor lines go to now (-1: stderr). With TOLKD_LOG set the file is
+// opened once and no path is built per line.
+int current_fd(LogState &s) {
+    const Destination &d = configured();
+    if (d.file != nullptr && s.fd >= 0 && s.destPath.size() != 0) return s.fd;
+    return dest_fd(s, destination());
 }
 
 // The ids in every line's header. Each getpid()/gettid() is a system call on the
@@ -287,11 +284,9 @@ extern "C" int __android_log_print(int prio, const char *tag, const char *fmt, .
     if (prio < ANDROID_LOG_VERBOSE) prio = ANDROID_LOG_INFO;
     if (tag == nullptr) tag = "";
     if (fmt == nullptr) fmt = "";
+    const Filter &f = filter();
+    if (prio < f.lowest || prio < min_level(f, tag)) return 0;
     LogState &s = state();
-    {
-        std::lock_guard<std::recursive_mutex> lock(s.mutex);
-        if (prio < min_level(s, tag)) return 0;
-    }
 
     int savedErrno = errno;  // callers log errno after the fact; keep it intact
     char msg[kMaxMessage];
@@ -329,12 +324,10 @@ extern "C" int __android_log_print(int prio, const char *tag, const char *fmt, .
         line = nl + 1;
     }
 
-    std::string dest = destination();
-    const char *toStderr = getenv("TOLKD_LOG_STDERR");
-    bool alsoStderr = toStderr != nullptr && strcmp(toStderr, "1") == 0;
+    const bool alsoStderr = configured().alsoStderr;
     {
         std::lock_guard<std::recursive_mutex> lock(s.mutex);
-        int fd = dest_fd(s, dest);
+        int fd = current_fd(s);
         if (fd >= 0) write_all(fd, out, olen);
         if (fd < 0 || alsoStderr) write_all(STDERR_FILENO, out, olen);
     }

@@ -4,6 +4,7 @@
 #include <signal.h>
 #include <sys/wait.h>
 
+#include <algorithm>
 #include <fstream>
 #include <memory>
 
@@ -20,9 +21,10 @@ const char kStore[] = "/nvram/PRODUCT_INFO";
 const std::string kAppUidProperty = std::string("/properties/") + CIT_APP_UID_PROPERTY;
 
 // The test application in a child process, on the abstract socket the daemon
+// The test application in a child process, on the abstract socket the daemon
 // connects to: one word (and its NUL) per read, noted in /app/heard and answered
-// with the file /app/WORD of the device root ("OK" without one). Ending it ends
-// its links, as a restart does.
+// with the file /app/WORD of the device root ("OK" without one), sent in two
+// pieces where the file has a "|". Ending it ends its links, as a restart does.
 class TestApp {
 public:
     explicit TestApp(const TestRoot &root) {
@@ -36,7 +38,11 @@ public:
                     std::ofstream(root.at("/app/heard"), std::ios::app) << buf << "\n";
                     const std::string word = std::string("/app/") + buf;
                     const std::string text = root.exists(word) ? root.read(word) : "OK";
-                    (void)!send(conn, text.data(), text.size(), MSG_NOSIGNAL);
+                    const size_t cut = std::min(text.find('|'), text.size());
+                    (void)!send(conn, text.data(), cut, MSG_NOSIGNAL);
+                    if (cut == text.size()) continue;
+                    usleep(5 * 1000);  // traffic shaping, not a wait: the link cuts the answer
+                    (void)!send(conn, text.data() + cut + 1, text.size() - cut - 1, MSG_NOSIGNAL);
                 }
             }
             _exit(0);
@@ -136,6 +142,7 @@ TEST_F(CitForward, LongAnswersAreCutSoTheFinalResultFits) {
         {pattern("Fail ", 1014), pattern("Fail ", 1014), false},
         {pattern("Fail ", 1015), pattern("Fail ", 1014), false},
         {pattern("Fail ", 1024), pattern("Fail ", 1014), false},  // a full receive buffer
+        {"Fa|il: no card", "Fail: no card", false},              // judged whole, not on "Fa"
     };
     for (const auto &c : cases) {
         root.write("/app/sn", c.answer);

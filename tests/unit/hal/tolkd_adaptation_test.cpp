@@ -1,13 +1,23 @@
-// The radio HAL bridge against an in-test radio service.
+// The radio HAL bridge against an in-test radio service, and the modem link that
+// reads what the bridge writes into the modem pair.
+#include <sys/ioctl.h>
+
 #include <cutils/properties.h>
 
 #include "dispatch/dispatcher.h"
 #include "fake_radio_service.h"
 #include "hal/tolkd_adaptation.h"
 #include "hal/tolkd_adaptation_impl.h"
+#include "targets/modem_link.h"
 #include "host_capture.h"
 
 namespace {
+
+// Bytes waiting at the main loop's end of the modem pair.
+int pendingInPair() {
+    int n = 0;
+    return ioctl(s_fdRild_command, FIONREAD, &n) == 0 ? n : -1;
+}
 
 bool slotEmpty(int slot) {
     pthread_mutex_lock(&gTolkdAdaptation->mMutex);
@@ -67,29 +77,38 @@ TEST_F(HalBridge, SlotComesFromTheSimSelection) {
     }
 }
 
-TEST_F(HalBridge, CommandGoesToTheSelectedSlotWithItsNulAndAnswersComeBackThroughThePair) {
+// Callbacks that reach the main loop in one read are still relayed and judged one
+// by one: an indication in front of the answer neither hides its final result nor
+// is glued to it, and text cut at a NUL (as some HALs send it) is framed like text
+// without one.
+TEST_F(HalBridge, CommandGoesToTheSelectedSlotAndEachCallbackIsRelayedOnItsOwn) {
     FakeRadioService slot1(slotPath("slot1")), slot2(slotPath("slot2"));
     ASSERT_EQ(0, property_set("persist.service.tolk.sim", "9"));
     ASSERT_EQ(0, property_set("persist.radio.cdma_slot", "2"));
 
-    EXPECT_EQ(0, sendDataToRild("AT+CSQ"));
+    const unsigned kTextPhase = 5;
+    EXPECT_EQ(0, sendToModem("AT+CMGS=\"1\"", nullptr, kTextPhase));
     EXPECT_TRUE(isATCmdInject);
     expectFrame(slot2, 1, RADIO_WIRE_REGISTER, 0, "");
-    expectFrame(slot2, 2, RADIO_WIRE_REQUEST, 0, std::string("AT+CSQ\0", 7));
+    expectFrame(slot2, 2, RADIO_WIRE_REQUEST, 0, std::string("AT+CMGS=\"1\"\0", 12));
     EXPECT_EQ(-1, slot2.frames()[1].serial);
     EXPECT_EQ(0, slot1.connections());
+    EXPECT_EQ(0, sendDataToRild("AT+CSQ"));
 
-    // Answer and unsolicited output reach the main-loop end byte for byte, in order.
-    ASSERT_TRUE(slot2.send(RADIO_WIRE_RESPONSE, "\r\n+CSQ: 20,99\r\n\r\nOK\r\n"));
-    ASSERT_TRUE(slot2.send(RADIO_WIRE_INDICATION, std::string("\r\n+CREG: 1\r\n\0", 13)));
-    const std::string expected = "\r\n+CSQ: 20,99\r\n\r\nOK\r\n" + std::string("\r\n+CREG: 1\r\n\0", 13);
-    std::string got;
-    ASSERT_TRUE(eventually([&] { return (got += drainFd(s_fdRild_command, 20)).size() >= expected.size(); }));
-    EXPECT_EQ(expected, got);
+    const std::string creg("\r\n+CREG: 1\r\n\0", 13), cms("\r\n+CMS ERROR: 330\r\n\0tail", 24),
+        csq("\r\n+CSQ: 20,99\r\n\r\nOK\r\n\0", 23);
+    ASSERT_TRUE(slot2.send(RADIO_WIRE_INDICATION, creg));
+    ASSERT_TRUE(slot2.send(RADIO_WIRE_RESPONSE, cms));
+    ASSERT_TRUE(slot2.send(RADIO_WIRE_RESPONSE, csq));
+    const int all = 3 * (int)sizeof(ModemRecordHeader) + (int)(creg.size() + cms.size() + csq.size());
+    ASSERT_TRUE(eventually([&] { return pendingInPair() == all; }));
+    EXPECT_EQ(kTextPhase, serveModemLink()) << "the final result of the SMS command ends its text phase";
+    EXPECT_EQ("\r\n+CREG: 1\r\n\r\n+CMS ERROR: 330\r\n\r\n+CSQ: 20,99\r\n\r\nOK\r\n", host.drain());
+    EXPECT_EQ(0, gMmiCmdSeq.idx) << "two commands, two answers; the indication answers nothing";
 
     // The same proxy serves the next command: no new connection, no new registration.
     EXPECT_TRUE(sendRequest("AT", 3));
-    expectFrame(slot2, 3, RADIO_WIRE_REQUEST, 0, std::string("AT\0", 3));
+    expectFrame(slot2, 4, RADIO_WIRE_REQUEST, 0, std::string("AT\0", 3));
     EXPECT_EQ(1, slot2.connections());
 }
 
@@ -116,12 +135,19 @@ TEST_F(HalBridge, ServiceDeathDropsItsOwnProxyOnlyAndTheNextCommandRegistersAgai
     ASSERT_TRUE(slot3.waitFrames(2));
     ASSERT_FALSE(slotEmpty(0));
 
+    // A command of a text phase waits on slot 3 when its service dies: the main
+    // loop learns that its answer will not come, and the phase ends.
+    EXPECT_EQ(0, sendToModem("AT+CMGW", nullptr, 9));
+    ASSERT_TRUE(slot3.waitFrames(3));
     slot3.dropConnections();
     ASSERT_TRUE(eventually([] { return slotEmpty(2); }));
     EXPECT_FALSE(slotEmpty(0)) << "slot 1's service lives on";
+    ASSERT_TRUE(eventually([] { return pendingInPair() == (int)sizeof(ModemRecordHeader); }));
+    EXPECT_EQ(9u, serveModemLink());
+    EXPECT_EQ(0, gMmiCmdSeq.idx) << "the lost answer is no longer outstanding";
     ASSERT_TRUE(sendRequest("AT+CGSN", 8));
-    expectFrame(slot3, 3, RADIO_WIRE_REGISTER, 1, "");
-    expectFrame(slot3, 4, RADIO_WIRE_REQUEST, 1, std::string("AT+CGSN\0", 8));
+    expectFrame(slot3, 4, RADIO_WIRE_REGISTER, 1, "");
+    expectFrame(slot3, 5, RADIO_WIRE_REQUEST, 1, std::string("AT+CGSN\0", 8));
 
     // A late notice about a proxy that was replaced meanwhile leaves the fresh one.
     pthread_mutex_lock(&gTolkdAdaptation->mMutex);
@@ -147,6 +173,8 @@ TEST_F(HalBridge, NewModemPairReplacesAndClosesTheOldBridgeEnd) {
     char c;
     EXPECT_EQ(0, recv(oldMainEnd, &c, 1, 0));
     close(oldMainEnd);
-    ASSERT_TRUE(slot1.send(RADIO_WIRE_RESPONSE, "\r\nRING\r\n"));
-    EXPECT_EQ("\r\nRING\r\n", drainFd(s_fdRild_command));
+    ASSERT_TRUE(slot1.send(RADIO_WIRE_INDICATION, "\r\nRING\r\n"));
+    ASSERT_TRUE(eventually([] { return pendingInPair() > 0; }));
+    serveModemLink();
+    EXPECT_EQ("\r\nRING\r\n", host.drain());
 }

@@ -6,9 +6,15 @@
 #include <signal.h>
 #include <termios.h>
 
+#include "eventually.h"
 #include "host_capture.h"
 
 namespace {
+
+bool pollIn(int fd) {
+    struct pollfd p = {fd, POLLIN, 0};
+    return poll(&p, 1, 0) == 1;
+}
 
 struct termios settingsOf(int fd) {
     struct termios t = {};
@@ -99,7 +105,10 @@ TEST_F(SerialDeviceTest, ControlDIsDataNotEndOfFile) {
 TEST_F(SerialDeviceTest, EchoSwitchKeepsSmsLineEnds) {
     const int fd = openPort();
     const struct termios opened = settingsOf(fd);
+    writeAll(master_, "AT+CSQ\n");  // typed right behind ATE0: it must still be read
+    ASSERT_TRUE(eventually([&] { return pollIn(fd); }));
     EXPECT_EQ(0, setEchoOption(0));
+    EXPECT_EQ("AT+CSQ\n", drainFd(fd));
     EXPECT_EQ(0, gSerialDevice.echoOption[DEVICE_SERIAL]);
     struct termios t = settingsOf(fd);
     EXPECT_EQ(static_cast<tcflag_t>(ICANON | IEXTEN), t.c_lflag);
@@ -177,20 +186,43 @@ TEST_F(AudioWriterTest, FatalErrorOnAdbDropsConnection) {
     EXPECT_EQ(-1, gSerialDevice.fd[DEVICE_ADB]);
 }
 
-TEST_F(AudioWriterTest, FatalErrorOnSerialReopensInMmiTestSet) {
+// Every reopen of the port (the audio writer's after a fatal write, the reader's
+// after a fatal read, a replug) leaves it in the settings of the mode it was in.
+TEST_F(AudioWriterTest, FatalErrorOnSerialReopensInTheModeThePortWasIn) {
     snprintf(gSerialDevice.devName[DEVICE_SERIAL], sizeof(gSerialDevice.devName[0]), "%s", slavePath_.c_str());
     // A descriptor that cannot be written: the write fails with EBADF.
-    gSerialDevice.fd[DEVICE_SERIAL] = open("/dev/null", O_RDONLY);
+    auto breakPort = [&] {
+        closeFd(gSerialDevice.fd[DEVICE_SERIAL]);
+        gSerialDevice.fd[DEVICE_SERIAL] = open("/dev/null", O_RDONLY);
+    };
     const std::string frame("\x10\0\r\n\x1a\x1b\r", 7);
+    openPort();
+    setMMITESTOption(1);
+    breakPort();
     writeDataToSerialByAudioType(frame.data(), 7);
-    const int reopened = gSerialDevice.fd[DEVICE_SERIAL];
+    int reopened = gSerialDevice.fd[DEVICE_SERIAL];
     ASSERT_GE(reopened, 0);
     EXPECT_EQ(frame, drainFd(master_));
     struct termios t = settingsOf(reopened);
     EXPECT_EQ(0u, t.c_iflag);
     EXPECT_EQ(static_cast<tcflag_t>(ICANON), t.c_lflag);
-    // What a later restore brings back is the freshly opened port.
+    // What a later restore brings back are the line settings of before the test.
     EXPECT_EQ(static_cast<tcflag_t>(ICANON | ECHO | IEXTEN), last_deviceOptions.c_lflag);
+    EXPECT_NE(0u, last_deviceOptions.c_iflag & ICRNL);
+    // Neither an erase nor a kill character: a frame holding 0x7F or 0x15 is whole.
+    const std::string mmiFrame = std::string("at^mmitest=\x15\x7f\x08", 14) + std::string(36, 'F') + "\n";
+    writeAll(master_, mmiFrame);
+    EXPECT_EQ(mmiFrame, drainFd(reopened));
+
+    // Restored, the mode is off, and the next reopen gives the line settings: in
+    // the MMI settings CR would end no line.
+    setMMITESTOption(0);
+    breakPort();
+    writeDataToSerialByAudioType(frame.data(), 7);
+    reopened = gSerialDevice.fd[DEVICE_SERIAL];
+    EXPECT_EQ(frame, drainFd(master_));
+    EXPECT_EQ(static_cast<tcflag_t>(ICANON | ECHO | IEXTEN), settingsOf(reopened).c_lflag);
+    EXPECT_NE(0u, settingsOf(reopened).c_iflag & ICRNL);
 
     // A port that cannot be opened again ends the process.
     GTEST_FLAG_SET(death_test_style, "threadsafe");
