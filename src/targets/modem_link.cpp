@@ -46,8 +46,7 @@ struct SlotAnswer {
     bool mmi;              // the answer of a customer MMI command
     AnswerPieces pieces;
     char tail[ANSWER_TAIL_KEEP];
-    int tailLen;           // its last bytes so far (text before any NUL)
-    bool textEnded;        // a NUL ended its text
+    int tailLen;           // its last bytes so far
     long long quietAt;     // when it is taken as complete without a final result
 };
 SlotAnswer answers[MODEM_SLOT_COUNT];
@@ -65,6 +64,7 @@ struct RecordReader {
     uint32_t left;         // data bytes of the record still to come
     char text[DATA_BUF_SIZE];
     int textLen;           // data received and not yet relayed
+    bool textEnded;        // a NUL ended the record's text: the rest is no text
     AnswerPieces pieces;   // an indication's framing
     HostLink to;           // an indication's link
 };
@@ -116,15 +116,13 @@ void openAnswer(int slot) {
     mmiTextLen = 0;
 }
 
-// Relays a piece of slot's answer; last: the answer ends with it.
+// Relays a piece of slot's answer (text only, no NUL); last: the answer ends with it.
 void answerPiece(int slot, const char *data, int len, bool last) {
     SlotAnswer *a = &answers[slot];
-    const int text = a->textEnded ? 0 : (int)strnlen(data, (size_t)len);
-    if (text < len) a->textEnded = true;
-    keepTail(a, data, text);
-    if (a->mmi && text > 0) {
+    keepTail(a, data, len);
+    if (a->mmi && len > 0) {
         int room = MAX_DATA_LEN - mmiTextLen;
-        int take = text < room ? text : room;
+        int take = len < room ? len : room;
         memcpy(mmiText + mmiTextLen, data, (size_t)take);
         mmiTextLen += take;
     }
@@ -173,6 +171,7 @@ void beginRecord(void) {
     rx.inRecord = true;
     rx.left = rx.header.length;
     rx.textLen = 0;
+    rx.textEnded = false;
     const int slot = validSlot(rx.header.slot);
     if (rx.header.kind == MODEM_RECORD_ANSWER && slot >= 0) {
         if (!answers[slot].open) openAnswer(slot);
@@ -192,16 +191,18 @@ unsigned relayRecordData(bool last) {
     if (isAnswerRecord()) {
         const int slot = rx.header.slot;
         SlotAnswer *a = &answers[slot];
+        // HAL data is text: a NUL ends the record's text (a HAL that terminates
+        // its strings sends one), not the answer, whose next callback may follow.
+        const int text = rx.textEnded ? 0 : (int)strnlen(rx.text, (size_t)rx.textLen);
+        if (text < rx.textLen) rx.textEnded = true;
         if (!last) {
-            answerPiece(slot, rx.text, rx.textLen, false);
+            answerPiece(slot, rx.text, text, false);
         } else {
-            // Whether this record ends the answer is known once its end is seen; a
-            // NUL ends its text, and so the answer.
-            const int text = (int)strnlen(rx.text, (size_t)rx.textLen);
+            // Whether this record ends the answer is known once its end is seen.
             SlotAnswer probe = *a;
             keepTail(&probe, rx.text, text);
-            const bool complete = answerComplete(&probe) || text < rx.textLen;
-            answerPiece(slot, rx.text, rx.textLen, complete);
+            const bool complete = answerComplete(&probe);
+            answerPiece(slot, rx.text, text, complete);
             rx.textLen = 0;
             if (complete) return closeAnswer(slot);
             a->quietAt = nowMs() + ANSWER_PIECE_WAIT_MS;

@@ -336,8 +336,8 @@ TEST_F(MmiQueue, SurplusModemOutputDoesNotStrandLaterCommands) {
 
     mmiCommand("AT+CUSD=+ORVTOLKJ");
     EXPECT_GE(gMmiCmdSeq.seq[0], 1);
-    modemAnswer(std::string("USSD\0tail", 9));  // the text ends at its first NUL, and the answer with it
-    EXPECT_EQ("AT+CUSD=+ORVTOLKJUSSD;", mmiClient());
+    modemAnswer(std::string("USSD\r\nOK\0tail", 13));  // the text ends at its first NUL
+    EXPECT_EQ("AT+CUSD=+ORVTOLKJUSSD\r\nOK;", mmiClient());
     EXPECT_EQ(-1, gMmiCmdSeq.seq[0]);
 
     // Surplus again, then an ordinary command before the MMI one: the MMI answer is
