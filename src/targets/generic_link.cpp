@@ -175,14 +175,51 @@ void genericLinkDrain(void) {
     }
 }
 
+namespace {
+
+// Hands the first len bytes of rx to the waiting command: copied into buf, relayed
+// to its link when relay is set, and taken from rx.
+int takeOwnAnswer(const HostLink *to, int len, char *buf, int size, bool relay) {
+    if (buf != NULL && size > 0) {
+        int copy = len < size - 1 ? len : size - 1;
+        memcpy(buf, rx, (size_t)copy);
+        buf[copy] = '\0';
+    }
+    LOGD("data receive from %d is %.*s, data length is %d", GENERIC_TYPE, len, rx, len);
+    if (relay) relayWhole(to, rx, len);
+    consume(len);
+    relayComplete();  // what came behind it answers later commands
+    return len;
+}
+
+}  // namespace
+
 int genericLinkAwaitAnswer(char *buf, int size, bool relay) {
     if (buf != NULL && size > 0) buf[0] = '\0';
     if (s_fdService_command < 0) return -1;
-    // Whatever was here before the command went out is no part of its answer.
-    completePending();
+    // The service answers in the order the commands went out: the answers still
+    // owed to earlier commands come first and go to their own links; this
+    // command's answer is the one after them. An earlier command's slow answer
+    // is never taken for this one's.
+    const HostLink self = currentHostLink();
+    int ahead = answersDue.count;
+    if (inAnswer && !ownerQueued) ahead++;  // output nobody asked for, still open
 
-    int end = 0;
     for (;;) {
+        // Complete answers in what has come: the earlier commands' go out, the
+        // next one is this command's.
+        for (int end; (end = finalResultEnd(rx, rxLen)) > 0;) {
+            if (ahead == 0) return takeOwnAnswer(&self, end, buf, size, relay);
+            relayAnswer(rx, end, true);
+            consume(end);
+            ahead--;
+        }
+        if (rxLen == MAX_DATA_LEN) {
+            if (ahead == 0) return takeOwnAnswer(&self, rxLen, buf, size, relay);
+            relayAnswer(rx, rxLen, false);  // a long earlier answer goes on
+            rxLen = 0;
+        }
+
         struct pollfd p = {s_fdService_command, POLLIN, 0};
         int rc = poll(&p, 1, rxLen > 0 ? ANSWER_PIECE_WAIT_MS : -1);
         if (rc < 0 && errno == EINTR) continue;
@@ -192,42 +229,25 @@ int genericLinkAwaitAnswer(char *buf, int size, bool relay) {
             return -1;
         }
         if (rc == 0) {
-            end = rxLen;  // quiet: this is all of it
-            break;
+            // Quiet with an answer unfinished: a service that answers without a
+            // final result line has said all it will.
+            if (ahead == 0) return takeOwnAnswer(&self, rxLen, buf, size, relay);
+            bool whole = (rxLen >= 2 && rx[rxLen - 2] == '\r' && rx[rxLen - 1] == '\n');
+            relayAnswer(rx, rxLen, whole);
+            rxLen = 0;
+            if (whole) ahead--;
+            continue;
         }
         LOGD("Prepare read the data from generic service");
         ssize_t n = receive(0);
+        if (n < 0 && errno == EAGAIN) continue;
         if (n <= 0) {
-            if (n < 0 && errno == EAGAIN) continue;
             if (n < 0) LOGE("fail to receive data from target socket. errno = %d", errno);
             else LOGD("The peer has performed an orderly shutdown");
-            int got = rxLen;
-            if (got > 0 && buf != NULL && size > 0) {
-                int copy = got < size - 1 ? got : size - 1;
-                memcpy(buf, rx, (size_t)copy);
-                buf[copy] = '\0';
-            }
-            if (got > 0 && relay) relayWhole(NULL, rx, got);
-            rxLen = 0;
+            int got = -1;
+            if (ahead == 0 && rxLen > 0) got = takeOwnAnswer(&self, rxLen, buf, size, relay);
             closeLink();
-            return got > 0 ? got : -1;
-        }
-        end = finalResultEnd(rx, rxLen);
-        if (end > 0) break;
-        if (rxLen == MAX_DATA_LEN) {
-            end = rxLen;
-            break;
+            return got;
         }
     }
-    if (buf != NULL && size > 0) {
-        int copy = end < size - 1 ? end : size - 1;
-        memcpy(buf, rx, (size_t)copy);
-        buf[copy] = '\0';
-    }
-    LOGD("data receive from %d is %.*s, data length is %d", GENERIC_TYPE, end, rx, end);
-    if (relay) relayWhole(NULL, rx, end);
-    consume(end);
-    // What came behind the answer is the next one's.
-    relayComplete();
-    return end;
 }

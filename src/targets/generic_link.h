@@ -22,11 +22,12 @@ int genericLinkQuietMs(void);
 void genericLinkQuiet(void);
 // Relays the complete answers already waiting on the link, without blocking.
 void genericLinkDrain(void);
-// Waits for the answer to the command just sent: what came before it belongs to
-// earlier commands and goes to their links first; then the first answer that
-// arrives, complete at its final result line or when the link goes quiet, is this
-// one. It is relayed to the current link when relay is set and copied into buf
-// (size bytes, NUL-terminated). Returns its length, or -1 when none came.
+// Waits for the answer to the command just sent (from the current line's link):
+// the answers still owed to earlier commands come first and go to their links;
+// the one after them, complete at its final result line or when the link goes
+// quiet, is this one. It is relayed to the current link when relay is set and
+// copied into buf (size bytes, NUL-terminated). Returns its length, or -1 when
+// none came (the link failed or ended first).
 int genericLinkAwaitAnswer(char *buf, int size, bool relay);
 // The link was closed: what is pending goes out, the answers due are forgotten.
 void genericLinkClosed(void);
