@@ -34,28 +34,38 @@ TEST_F(ClockCmdTest, SetTakesTheFieldsAsUtcAndLeavesTzAlone) {
     EXPECT_LE(secondsFrom(k20240229Noon), 2);
     EXPECT_EQ(32, gCclkTz);
     EXPECT_EQ(tz + 3, std::getenv("TZ")) << "the caller's TZ entry itself, not a copy";
-
     unsetenv("TZ");
     tzset();
-    // Hour 24, minute 60 and second 60 pass the check and roll over; hour 0 is a time.
-    EXPECT_EQ(0, cclk("24/02/29, 24:60:60"));
-    EXPECT_LE(secondsFrom(1709254860), 2);
+    EXPECT_EQ(0, cclk("24/02/29, 12:00:00"));
     EXPECT_EQ(nullptr, std::getenv("TZ")) << "an unset TZ stays unset";
     EXPECT_EQ(32, gCclkTz) << "17 characters leave the stored zone";
     EXPECT_STREQ("", response);
-    EXPECT_EQ(0, cclk("24/03/01,00:00:00"));
-    EXPECT_LE(secondsFrom(k20240229Noon + 12 * 3600), 2);
 }
 
-TEST_F(ClockCmdTest, SetRefusesBadFieldsZonesAndCutsAnOverlongValue) {
-    time_t before = time(nullptr);
-    // Month 13 and a refused date with a good zone: local_commands.tx.
-    for (const char *bad : {"24/00/01,00:00:00", "24/01/32,00:00:00", "24/01/01,25:00:00", "24/01/01,00:61:00",
-                            "ab/01/01,00:00:00", "24/02/29,12:00:00+99"}) {
+// Every day a calendar has, the zone limits, a leap second and the end of a day;
+// nothing that would roll over into another date. (Hour 00, month 13 and the
+// CME ERROR of a wrong length: local_commands.tx.)
+TEST_F(ClockCmdTest, SetTakesRealDatesOnlyAndARefusalChangesNothing) {
+    const std::pair<const char *, time_t> good[] = {
+        {"24/01/31,00:00:00+96", 1706659200}, {"23/12/31,23:59:60-96", 1704067200},
+        {"24/02/29,24:00:00", 1709251200},    {"00/02/29,00:00:00", 951782400},
+        {"99/04/01,00:00:00", 4078684800},
+    };
+    for (const auto &g : good) {
+        EXPECT_EQ(0, cclk(g.first)) << g.first;
+        EXPECT_LE(secondsFrom(g.second), 2) << g.first;
+    }
+    EXPECT_EQ(-96, gCclkTz);
+    const time_t before = time(nullptr);
+    for (const char *bad : {"23/02/29,00:00:00", "24/02/30,12:00:00", "24/04/31,23:59:60+32", "24/00/01,00:00:00",
+                            "24/01/32,00:00:00", "24/01/00,00:00:00", "24/01/01,12:60:00", "24/01/01,24:00:01",
+                            "24/01/01,25:00:00", "24/02/29;12:34:56", "24/02/29,12:34.56", "ab/01/01,00:00:00",
+                            "-1/01/01,00:00:00", "24/01/01,00:00:00+97", "24/01/01,00:00:00-97",
+                            "24/01/01,00:00:00+3x", "24/01/01,00:00:00032", "24/01/01,00:00:61+04"}) {
         EXPECT_EQ(4, cclk(bad)) << bad;
         EXPECT_STREQ("", response) << bad;
     }
-    EXPECT_EQ(65535, gCclkTz) << "a zone out of range is not stored";
+    EXPECT_EQ(-96, gCclkTz) << "a refused command stores no zone";
     EXPECT_LE(secondsFrom(before), 2) << "no refused value moved the clock";
     // The working copy stops at 39 characters, the answer at the buffer's end.
     std::string huge(5000, '1');
@@ -103,9 +113,9 @@ TEST_F(HandlerTest, EchoAndPropertySwitchesTakeOnlyTheirValues) {
 }
 
 // AT@USBCONFIG: at most the first 91 characters count, and quotes dropped from
-// them are not made up for by later ones; a store that cannot take the value
-// gives ERROR with the value echoed.
-TEST_F(HandlerTest, UsbConfigCutAndRefusedByTheStore) {
+// them are not made up for by later ones. A store that cannot take a value gives
+// ERROR (AT@USBCONFIG with the value echoed): the setting did not change.
+TEST_F(HandlerTest, UsbConfigCutAndPropertyWritesRefusedByTheStore) {
     const std::string param(89, 'a');
     EXPECT_EQ(0, call(pas_usbconfig_handler, ("'" + param + "'XYZ").c_str(), AT_SET_OP));
     EXPECT_EQ(param, prop("sys.usb.config"));
@@ -113,6 +123,10 @@ TEST_F(HandlerTest, UsbConfigCutAndRefusedByTheStore) {
     root.write("/properties", "not a folder");
     EXPECT_EQ(4, call(pas_usbconfig_handler, "adb", AT_SET_OP));
     EXPECT_STREQ("\r\n@USBCONFIG=\"adb\"\r\n\r\nERROR\r\n", response);
+    for (CmdHandler h : {pas_tolk_handler, pas_eurc_handler, pas_usbTethering_handler, pas_esuo_handler}) {
+        EXPECT_EQ(4, call(h, h == pas_esuo_handler ? "4" : "1", AT_SET_OP));
+        EXPECT_EQ(4, call(h, h == pas_esuo_handler ? "5" : "0", AT_SET_OP));
+    }
 }
 
 }  // namespace
