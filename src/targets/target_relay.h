@@ -14,5 +14,10 @@ int serviceReaderLoopWithResult(const char *cmd);
 void audioReaderLoop(int target);
 int sendDataToGenericService(const char *data);
 int sendDataToAudio(const char *data, int len, int target);
+// Sends cmd to the generic service and collects its answer into buf without
+// relaying it. Returns the answer's length (-1 when there is no link or it failed
+// first); *finalAt is the offset of the final result line, cut out of the answer
+// as its own string ("OK", "ERROR", "+CME ERROR: 3"), or -1 when it had none.
+int exchangeWithGenericService(const char *cmd, char *buf, int size, int *finalAt);
 
 #endif
