@@ -99,17 +99,13 @@ TEST_F(HandlerTest, SimSelectionFollowsTheSimCountAndC2kMode) {
     EXPECT_EQ("\r\n+ESUO: (4-6)\r\n", host.take());
 }
 
-// Echo takes only the digits 0 and 1; a switch takes a quoted value too. (AT%EURC
-// shares the switch handler, and a stored number out of range: local_commands.tx.)
-TEST_F(HandlerTest, EchoAndPropertySwitchesTakeOnlyTheirValues) {
+// Echo takes only the digits 0 and 1. (Quoted numbers: AtTok.)
+TEST_F(HandlerTest, EchoTakesOnlyItsValues) {
     gSerialDevice.echoOption[DEVICE_SERIAL] = 1;
     EXPECT_EQ(4, call(pas_echo_handler, "ATE2", AT_BASIC_OP));
     EXPECT_EQ(1, gSerialDevice.echoOption[DEVICE_SERIAL]);
     EXPECT_EQ(0, call(pas_echo_handler, "ate0", AT_BASIC_OP));
     EXPECT_EQ(0, gSerialDevice.echoOption[DEVICE_SERIAL]);
-    EXPECT_EQ(0, call(pas_tolk_handler, "1", AT_SET_OP));
-    EXPECT_EQ(0, call(pas_tolk_handler, "\"0\"", AT_SET_OP));
-    EXPECT_EQ("0", prop("persist.service.tolk.usermode"));
 }
 
 // AT@USBCONFIG: at most the first 91 characters count, and quotes dropped from
