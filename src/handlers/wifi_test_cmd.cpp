@@ -35,16 +35,8 @@ int wifiTxPower = 0;
 // judges the service's answer. Its information text is shown to the host; its
 // final result is not, so that the command ends with exactly one, its own.
 static bool askFramework(const char *cmd) {
-    char answer[DATA_BUF_SIZE];
-    int finalAt = -1;
-    int len = exchangeWithGenericService(cmd, answer, (int)sizeof(answer), &finalAt);
-    if (len < 0) return false;
-    int infoEnd = finalAt >= 0 ? finalAt : len;
-    int infoStart = 0;
-    while (infoStart < infoEnd && (answer[infoStart] == '\r' || answer[infoStart] == '\n')) infoStart++;
-    while (infoEnd > infoStart && (answer[infoEnd - 1] == '\r' || answer[infoEnd - 1] == '\n')) infoEnd--;
-    if (infoEnd > infoStart) writeDataToSerial(answer + infoStart, infoEnd - infoStart);
-    return finalAt >= 0 && strcmp(answer + finalAt, "OK") == 0;
+    char finalLine[DATA_BUF_SIZE];
+    return exchangeWithGenericService(cmd, finalLine, (int)sizeof(finalLine)) == 0 && strcmp(finalLine, "OK") == 0;
 }
 
 // The state always names who holds the chip. Wi-Fi goes to the framework only with

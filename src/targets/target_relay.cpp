@@ -268,15 +268,16 @@ int sendDataToAudio(const char *data, int len, int target) {
 
 // For a command that answers the host with its own final result (AT^WIENABLE).
 // Bytes already waiting on the link belong to earlier commands and are relayed
-// first. The answer ends at its first final result line; whatever came after it
-// belongs to others and is relayed. An answer that stops short of a final result
-// is taken as it is once nothing more came for GENERIC_ANSWER_PIECE_WAIT_MS: the
-// pieces of one answer follow each other within milliseconds.
+// first. The answer ends at its first final result line: the text before it goes
+// to the host as one answer, the line itself to the caller, and whatever came
+// after it belongs to others and is relayed after. An answer that stops short of
+// a final result is taken as it is once nothing more came for
+// GENERIC_ANSWER_PIECE_WAIT_MS: the pieces of one answer follow each other within
+// milliseconds.
 #define GENERIC_ANSWER_PIECE_WAIT_MS 500
-int exchangeWithGenericService(const char *cmd, char *buf, int size, int *finalAt) {
-    *finalAt = -1;
-    if (buf == NULL || size < 2) return -1;
-    buf[0] = '\0';
+int exchangeWithGenericService(const char *cmd, char *finalLine, int size) {
+    if (finalLine == NULL || size < 1) return -1;
+    finalLine[0] = '\0';
     if (s_fdService_command < 0) connectTarget(GENERIC_TYPE);
     struct pollfd waiting = {s_fdService_command, POLLIN, 0};
     while (s_fdService_command >= 0 && poll(&waiting, 1, 0) == 1) {
@@ -287,15 +288,17 @@ int exchangeWithGenericService(const char *cmd, char *buf, int size, int *finalA
     if (s_fdService_command < 0) return -1;
     sendDataToGenericService(cmd);
 
+    char buf[DATA_BUF_SIZE];
     size_t len = 0;
     size_t lineStart = 0;
+    size_t finalAt = 0, finalLen = 0, restAt = 0;  // restAt 0: no final line yet
     int waitMs = -1;  // the answer itself is waited for without limit
-    while (*finalAt < 0 && len + 1 < (size_t)size) {
+    while (restAt == 0 && len < MAX_DATA_LEN) {
         struct pollfd p = {s_fdService_command, POLLIN, 0};
         int rc = poll(&p, 1, waitMs);
         if (rc < 0 && errno == EINTR) continue;
         if (rc == 0) break;
-        ssize_t n = rc > 0 ? recv(s_fdService_command, buf + len, (size_t)size - 1 - len, 0) : -1;
+        ssize_t n = rc > 0 ? recv(s_fdService_command, buf + len, MAX_DATA_LEN - len, 0) : -1;
         if (n < 0 && errno == EINTR) continue;
         if (n <= 0) {
             LOGE("generic service link ended while answering %s. errno = %d", cmd, errno);
@@ -307,21 +310,31 @@ int exchangeWithGenericService(const char *cmd, char *buf, int size, int *finalA
         len += (size_t)n;
         buf[len] = '\0';
         waitMs = GENERIC_ANSWER_PIECE_WAIT_MS;
-        for (char *nl; *finalAt < 0 && (nl = strchr(buf + lineStart, '\n')) != NULL;
-             lineStart = (size_t)(nl - buf) + 1) {
-            char *line = buf + lineStart;
+        for (char *nl; restAt == 0 && (nl = strchr(buf + lineStart, '\n')) != NULL;) {
+            const char *line = buf + lineStart;
             size_t lineLen = (size_t)(nl - line);
             if (lineLen > 0 && line[lineLen - 1] == '\r') lineLen--;
+            restAt = (size_t)(nl - buf) + 1;
             if ((lineLen == 2 && strncmp(line, "OK", 2) == 0) || (lineLen == 5 && strncmp(line, "ERROR", 5) == 0) ||
                 strncmp(line, "+CME ERROR:", 11) == 0 || strncmp(line, "+CMS ERROR:", 11) == 0) {
-                *finalAt = (int)lineStart;
-                size_t rest = (size_t)(nl - buf) + 1;
-                if (rest < len) writeDataToSerial(buf + rest, (int)(len - rest));
-                line[lineLen] = '\0';
-                len = lineStart + lineLen;
+                finalAt = lineStart;
+                finalLen = lineLen;
+            } else {
+                lineStart = restAt;
+                restAt = 0;
             }
         }
     }
-    LOGD("generic service answered %s with %s", cmd, buf);
-    return (int)len;
+    size_t infoStart = 0, infoEnd = restAt != 0 ? finalAt : len;
+    while (infoStart < infoEnd && (buf[infoStart] == '\r' || buf[infoStart] == '\n')) infoStart++;
+    while (infoEnd > infoStart && (buf[infoEnd - 1] == '\r' || buf[infoEnd - 1] == '\n')) infoEnd--;
+    if (infoEnd > infoStart) writeDataToSerial(buf + infoStart, (int)(infoEnd - infoStart));
+    if (restAt != 0) {
+        if (finalLen >= (size_t)size) finalLen = (size_t)size - 1;
+        memcpy(finalLine, buf + finalAt, finalLen);
+        finalLine[finalLen] = '\0';
+        if (restAt < len) writeDataToSerial(buf + restAt, (int)(len - restAt));
+    }
+    LOGD("generic service answered %s with %s", cmd, finalLine);
+    return 0;
 }

@@ -14,10 +14,10 @@ int serviceReaderLoopWithResult(const char *cmd);
 void audioReaderLoop(int target);
 int sendDataToGenericService(const char *data);
 int sendDataToAudio(const char *data, int len, int target);
-// Sends cmd to the generic service and collects its answer into buf without
-// relaying it. Returns the answer's length (-1 when there is no link or it failed
-// first); *finalAt is the offset of the final result line, cut out of the answer
-// as its own string ("OK", "ERROR", "+CME ERROR: 3"), or -1 when it had none.
-int exchangeWithGenericService(const char *cmd, char *buf, int size, int *finalAt);
+// Sends cmd to the generic service and relays its answer to the host, all but
+// its final result line, which is stored in finalLine ("OK", "ERROR",
+// "+CME ERROR: 3"; empty when the answer had none). Returns 0, or -1 when there
+// is no link or it failed before any answer came.
+int exchangeWithGenericService(const char *cmd, char *finalLine, int size);
 
 #endif

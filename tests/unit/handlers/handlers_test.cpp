@@ -4,6 +4,7 @@
 #include <cstdlib>
 #include <ctime>
 #include <filesystem>
+#include <thread>
 
 #include "../dispatch/handler_state.h"
 #include "attok/at_tok.h"
@@ -123,6 +124,23 @@ TEST_F(HandlerTest, UsbConfigCutAndPropertyWritesRefusedByTheStore) {
         EXPECT_EQ(4, call(h, h == pas_esuo_handler ? "4" : "1", AT_SET_OP));
         EXPECT_EQ(4, call(h, h == pas_esuo_handler ? "5" : "0", AT_SET_OP));
     }
+}
+
+// What waited on the framework's link before the command is an earlier answer and
+// goes to the host first; what came behind the final result line goes after the
+// answer's own text. (The answers themselves: wifi_test.tx.)
+TEST_F(HandlerTest, WifiFrameworkExchangeRelaysWhatIsNotItsAnswerInOrder) {
+    int service = socketLink(&s_fdService_command);
+    writeAll(service, "\r\n+EARLIER: 1\r\n\r\nERROR\r\n");
+    std::thread framework([service] {
+        EXPECT_EQ("AT+WITOF=2", drainFd(service, 3000, 0));
+        writeAll(service, "\r\n+WITOF: 1\r\n\r\nOK\r\n\r\n+LATER\r\n");
+    });
+    EXPECT_EQ(0, call(pas_wienable_handler, "1", AT_SET_OP));
+    framework.join();
+    EXPECT_EQ("\r\n+EARLIER: 1\r\n\r\nERROR\r\n\r\n+WITOF: 1\r\n\r\n+LATER\r\n", host.take());
+    closeFd(s_fdService_command);
+    closeFd(service);
 }
 
 }  // namespace
