@@ -61,13 +61,17 @@ void answer(const char *text, int len) { writeDataToSerial(text, len); }
 
 void answerText(const char *text) { writeDataToSerial(text, (int)strlen(text)); }
 
-void answerError(void) { answer(kAnswerError, (int)strlen(kAnswerError)); }
+// Answers ERROR; gives the handler result of a command that was answered.
+int answerError(void) {
+    answer(kAnswerError, (int)strlen(kAnswerError));
+    return 0;
+}
 
 // The next parameter of a flag command: one whole decimal number from 0 to max,
 // blanks around it allowed. A station records every OK, so a typo must never
 // stand for an index or a value.
 bool flagNumber(char **cursor, int max, int *out) {
-    int v = 0;
+    int v;
     if (at_tok_nextint_strict(cursor, &v) != 0 || v < 0 || v > max) return false;
     *out = v;
     return true;
@@ -77,8 +81,7 @@ bool flagNumber(char **cursor, int max, int *out) {
 int cit_start_handler(char *) {
     if (property_set(kRunningProp, "1") != 0) {
         NLOGE("set %s fails", kRunningProp);
-        answerError();
-        return 0;
+        return answerError();
     }
     char value[PROPERTY_VALUE_MAX] = {0};
     property_get(kRunningProp, value, "2");
@@ -99,10 +102,7 @@ int cit_shutdown_handler(char *) {
 int cit_readmmi1_handler(char *) {
     int flag = getFlag(FLAG_MMI1_RESULT);
     NLOGD("(%d)==%d", FLAG_MMI1_RESULT, flag);
-    if (flag < 0) {
-        answerError();
-        return 0;
-    }
+    if (flag < 0) return answerError();
     const char *mark = flag == 0 ? "F" : (flag == 1 ? "P" : "");
     char buf[64];
     snprintf(buf, sizeof(buf), "MMI1 _%s%s", mark, kAnswerOk);
@@ -113,10 +113,7 @@ int cit_readmmi1_handler(char *) {
 int cit_readuserat_handler(char *) {
     int flag = getFlag(FLAG_USER_AT);
     NLOGD("(%d)==%d", FLAG_USER_AT, flag);
-    if (flag < 0) {
-        answerError();
-        return 0;
-    }
+    if (flag < 0) return answerError();
     const char *mark = flag == 0 ? "0" : (flag == 1 ? "1" : "");
     char buf[64];
     snprintf(buf, sizeof(buf), "UserAT =%s%s", mark, kAnswerOk);
@@ -126,10 +123,7 @@ int cit_readuserat_handler(char *) {
 
 // A pass is answered only for a flag that reached the store: the station records it.
 int cit_writeuserat_handler(char *) {
-    if (setFlag(FLAG_USER_AT, 0) != 0) {
-        answerError();
-        return 0;
-    }
+    if (setFlag(FLAG_USER_AT, 0) != 0) return answerError();
     NLOGD("(%d)==%d", FLAG_USER_AT, getFlag(FLAG_USER_AT));
     answer("WriteUserAT Pass\r\nOK\r\n", 22);
     return 0;
@@ -137,10 +131,7 @@ int cit_writeuserat_handler(char *) {
 
 int cit_readreset_handler(char *) {
     int flag = getFlag(FLAG_RESET_STATE);
-    if (flag < 0) {
-        answerError();
-        return 0;
-    }
+    if (flag < 0) return answerError();
     const char *mark = "";
     if (flag == 'b') {
         NLOGD("(208)=='b'");
@@ -161,20 +152,16 @@ int cit_readreset_handler(char *) {
 // "=index": the index must be a whole number within the record, and nothing may
 // follow it; anything else is refused, as is a flag that could not be read.
 int cit_readproinfo_handler(char *line) {
-    char *cursor = strchr(line, '=');
-    int index = -1;
-    if (cursor != nullptr) cursor++;
-    if (cursor == nullptr || !flagNumber(&cursor, PRODUCT_INFO_SIZE - 1, &index) || at_tok_hasmore(&cursor)) {
+    char *cursor = line;
+    int index;
+    if (at_tok_start_flag(&cursor, '=') < 0 || !flagNumber(&cursor, PRODUCT_INFO_SIZE - 1, &index) ||
+        at_tok_hasmore(&cursor)) {
         NLOGE("no flag index in %s", line);
-        answerError();
-        return 0;
+        return answerError();
     }
     NLOGD("Index = %d", index);
     int flag = getFlag(index);
-    if (flag < 0) {
-        answerError();
-        return 0;
-    }
+    if (flag < 0) return answerError();
     char buf[64];
     snprintf(buf, sizeof(buf), "Result=%d%s", flag, kAnswerOk);
     answerText(buf);
@@ -185,22 +172,17 @@ int cit_readproinfo_handler(char *line) {
 // byte. Anything else, and a value that did not reach the store, is answered with
 // an error and stores nothing.
 int cit_writeproinfo_handler(char *line) {
-    char *cursor = strchr(line, '=');
-    int index = -1;
-    int value = -1;
-    if (cursor != nullptr) cursor++;
-    if (cursor == nullptr || !flagNumber(&cursor, PRODUCT_INFO_SIZE - 1, &index) ||
+    char *cursor = line;
+    int index;
+    int value;
+    if (at_tok_start_flag(&cursor, '=') < 0 || !flagNumber(&cursor, PRODUCT_INFO_SIZE - 1, &index) ||
         !flagNumber(&cursor, FLAG_VALUE_MAX, &value) || at_tok_hasmore(&cursor)) {
         NLOGE("no flag index and value in %s", line);
-        answerError();
-        return 0;
+        return answerError();
     }
     NLOGD("index = %d", index);
     NLOGD("flag = %d", value);
-    if (setFlag(index, (unsigned char)value) != 0) {
-        answerError();
-        return 0;
-    }
+    if (setFlag(index, (unsigned char)value) != 0) return answerError();
     answer(kAnswerOk, 6);
     return 0;
 }
@@ -250,10 +232,7 @@ bool writeResultWhole(char result) {
 }
 
 int cit_write_result(char result) {
-    if (!writeResultInPlace(result) && !writeResultWhole(result)) {
-        answerError();
-        return 0;
-    }
+    if (!writeResultInPlace(result) && !writeResultWhole(result)) return answerError();
     sync();
     answer(kAnswerOk, 6);
     return 0;

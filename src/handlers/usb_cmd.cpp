@@ -27,7 +27,7 @@ int pas_usbTethering_handler(const char *param, int opType, char *response) {
         return RESPONSE_OK;
     }
     case AT_SET_OP: {
-        int value = 0;
+        int value;
         int rc = onlyParamNumber(param, &value, RESPONSE_ERROR);
         if (rc != RESPONSE_OK) return rc;
         if (value != 0 && value != 1) return RESPONSE_ERROR;
@@ -36,7 +36,7 @@ int pas_usbTethering_handler(const char *param, int opType, char *response) {
             LOGE("set %s to %d failed", USB_TETHERING_PROPERTY, value);
             return RESPONSE_ERROR;
         }
-        if (value == 1) LOGD("set usbTethering to 1");
+        LOGD("set usbTethering to %d", value);
         return RESPONSE_OK;
     }
     default:
