@@ -97,14 +97,14 @@ static int wholeNumber(char **cursor, long long min, long long max, long long *v
 }
 
 int at_tok_nextint_strict(char **cursor, int *out) {
-    long long v;
+    long long v = 0;
     int rc = wholeNumber(cursor, INT_MIN, INT_MAX, &v);
     if (rc == 0 && out != NULL) *out = (int)v;
     return rc;
 }
 
 int at_tok_nextint64_strict(char **cursor, int64_t *out) {
-    long long v;
+    long long v = 0;
     int rc = wholeNumber(cursor, INT64_MIN, INT64_MAX, &v);
     if (rc == 0 && out != NULL) *out = (int64_t)v;
     return rc;

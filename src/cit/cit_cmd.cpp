@@ -71,7 +71,7 @@ int answerError(void) {
 // blanks around it allowed. A station records every OK, so a typo must never
 // stand for an index or a value.
 bool flagNumber(char **cursor, int max, int *out) {
-    int v;
+    int v = 0;
     if (at_tok_nextint_strict(cursor, &v) != 0 || v < 0 || v > max) return false;
     *out = v;
     return true;
@@ -153,7 +153,7 @@ int cit_readreset_handler(char *) {
 // follow it; anything else is refused, as is a flag that could not be read.
 int cit_readproinfo_handler(char *line) {
     char *cursor = line;
-    int index;
+    int index = 0;
     if (at_tok_start_flag(&cursor, '=') < 0 || !flagNumber(&cursor, PRODUCT_INFO_SIZE - 1, &index) ||
         at_tok_hasmore(&cursor)) {
         NLOGE("no flag index in %s", line);
@@ -173,8 +173,8 @@ int cit_readproinfo_handler(char *line) {
 // an error and stores nothing.
 int cit_writeproinfo_handler(char *line) {
     char *cursor = line;
-    int index;
-    int value;
+    int index = 0;
+    int value = 0;
     if (at_tok_start_flag(&cursor, '=') < 0 || !flagNumber(&cursor, PRODUCT_INFO_SIZE - 1, &index) ||
         !flagNumber(&cursor, FLAG_VALUE_MAX, &value) || at_tok_hasmore(&cursor)) {
         NLOGE("no flag index and value in %s", line);

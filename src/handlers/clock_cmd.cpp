@@ -195,7 +195,7 @@ int pas_cclk_handler(const char *param, int opType, char *response) {
 // One field of AT+CSDF=: empty (it keeps *value, the default) or a whole number
 // from 1 to max. A typo must not select a format.
 static bool csdfField(char **cursor, int max, int *value) {
-    int v;
+    int v = 0;
     int rc = at_tok_nextint_strict(cursor, &v);
     if (rc == AT_TOK_EMPTY) return true;
     if (rc != 0 || v < 1 || v > max) return false;

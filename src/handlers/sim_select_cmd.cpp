@@ -105,7 +105,7 @@ int pas_esuo_handler(const char *param, int opType, char *response) {
     case AT_TEST_OP:
         return esuoTest(multiSim);
     case AT_SET_OP: {
-        int value;
+        int value = 0;
         int rc = onlyParamNumber(param, &value, RESPONSE_ERROR);
         if (rc != RESPONSE_OK) return rc;
         if (isCdmaLteDcSupport()) return esuoSetC2k(value);

@@ -35,7 +35,7 @@ static const SwitchCmd kTolk = {"persist.service.tolk.usermode", "+TOLK:1\r\n", 
 // refused like one without digits, and a value the property store did not take is
 // an error: the switch did not change.
 static int switchSet(const SwitchCmd *sw, const char *param) {
-    int value;
+    int value = 0;
     int rc = onlyParamNumber(param, &value, RESPONSE_INVALID);
     if (rc != RESPONSE_OK) return rc;
     if (value != 0 && value != 1) return RESPONSE_OK;
@@ -87,7 +87,7 @@ int pas_vzwtolkcfg_handler(const char *param, int opType, char *response) {
         return RESPONSE_OK;
     }
     case AT_SET_OP: {
-        int value;
+        int value = 0;
         if (onlyParamNumber(param, &value, RESPONSE_ERROR) != RESPONSE_OK || (value != 0 && value != 1))
             return RESPONSE_ERROR;
         gVzwTolkCfg = value;

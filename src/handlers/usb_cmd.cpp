@@ -27,7 +27,7 @@ int pas_usbTethering_handler(const char *param, int opType, char *response) {
         return RESPONSE_OK;
     }
     case AT_SET_OP: {
-        int value;
+        int value = 0;
         int rc = onlyParamNumber(param, &value, RESPONSE_ERROR);
         if (rc != RESPONSE_OK) return rc;
         if (value != 0 && value != 1) return RESPONSE_ERROR;

@@ -80,7 +80,7 @@ int pas_wienable_handler(const char *param, int opType, char *response) {
         return RESPONSE_OK;
     }
     if (opType != AT_SET_OP) return RESPONSE_ERROR;
-    int value;
+    int value = 0;
     int rc = onlyParamNumber(param, &value, RESPONSE_ERROR);
     return rc != RESPONSE_OK ? rc : wifiHandOver(value);
 }
@@ -94,7 +94,7 @@ int pas_wimode_handler(const char *param, int opType, char *response) {
     }
     if (opType != AT_SET_OP) return RESPONSE_ERROR;
 
-    int value;
+    int value = 0;
     int rc = onlyParamNumber(param, &value, RESPONSE_ERROR);
     if (rc != RESPONSE_OK) return rc;
     if (value < 0 || value > WIFI_MODE_MAX) return RESPONSE_ERROR;
@@ -113,7 +113,7 @@ int pas_wiband_handler(const char *param, int opType, char *response) {
     }
     if (opType != AT_SET_OP) return RESPONSE_ERROR;
 
-    int value;
+    int value = 0;
     int rc = onlyParamNumber(param, &value, RESPONSE_ERROR);
     if (rc != RESPONSE_OK) return rc;
     if (value != 0 && value != 1) return RESPONSE_ERROR;
@@ -139,7 +139,7 @@ static int storedValueHandler(int *stored, WifiSetter setter, const char *param,
     }
     if (opType != AT_SET_OP) return RESPONSE_ERROR;
 
-    int value;
+    int value = 0;
     int rc = onlyParamNumber(param, &value, RESPONSE_INVALID);
     if (rc != RESPONSE_OK) return rc;
     if (!setter(value)) {
@@ -167,7 +167,7 @@ int pas_wipow_handler(const char *param, int opType, char *response) {
 int pas_witx_handler(const char *param, int opType, char *response) {
     (void)response;
     if (opType != AT_SET_OP) return RESPONSE_ERROR;
-    int value;
+    int value = 0;
     int rc = onlyParamNumber(param, &value, RESPONSE_INVALID);
     if (rc != RESPONSE_OK) return rc;
     return WIFI_TEST_SetTX(value != 0) ? RESPONSE_OK : RESPONSE_ERROR;
@@ -187,7 +187,7 @@ int pas_wirx_handler(const char *param, int opType, char *response) {
     if (opType != AT_SET_OP) return RESPONSE_ERROR;
     char buf[PARAM_BUF_SIZE];
     char *cursor = copyParam(param, buf, sizeof(buf));
-    int value;
+    int value = 0;
     int rc = nextParamNumber(&cursor, &value, RESPONSE_ERROR);
     if (rc != RESPONSE_OK) return rc;
 
