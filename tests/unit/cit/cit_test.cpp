@@ -2,6 +2,7 @@
 // record, the result file) and those passed to the test application, against an
 // in-test application on the abstract socket the daemon connects to.
 #include <signal.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 
 #include <filesystem>
@@ -98,10 +99,24 @@ TEST_F(CitLocal, FlagWritesAnswerOkOnlyWhenStored) {
 // A file too short to hold character 7 is written whole, never padded with NULs,
 // and one that can be neither opened nor created answers ERROR: root_faults.tx.
 TEST_F(CitLocal, ResultFileEdges) {
-    // An existing file keeps its other characters; only character 7 changes.
-    root.write(CIT_RESULT_FILE, "y1234560tail");
-    ask("AT*CIT_WCITF");
-    EXPECT_EQ("y1234561tail", root.read(CIT_RESULT_FILE));
+    // An existing file keeps its other characters; only character 7 changes, and
+    // a file of 7 characters has room for it. Nothing is left open.
+    const size_t fds = std::distance(std::filesystem::directory_iterator("/proc/self/fd"), {});
+    for (const char *before : {"y1234560tail", "y123456"}) {
+        root.write(CIT_RESULT_FILE, before);
+        EXPECT_EQ("\r\nOK\r\n", ask("AT*CIT_WCITF"));
+        EXPECT_EQ(std::string(before).replace(7, 1, "1"), root.read(CIT_RESULT_FILE));
+    }
+    EXPECT_EQ(fds, std::distance(std::filesystem::directory_iterator("/proc/self/fd"), {}));
+    // A disk that takes nothing more (a file size limit of 0): no result is stored.
+    signal(SIGXFSZ, SIG_IGN);
+    struct rlimit old, none;
+    ASSERT_EQ(0, getrlimit(RLIMIT_FSIZE, &old));
+    none = {0, old.rlim_max};
+    ASSERT_EQ(0, setrlimit(RLIMIT_FSIZE, &none));
+    const std::string full = ask("AT*CIT_CCITF");
+    ASSERT_EQ(0, setrlimit(RLIMIT_FSIZE, &old));
+    EXPECT_EQ("\r\nERROR\r\n", full);
     // At most 32 characters of the first line are shown.
     root.write(CIT_RESULT_FILE, std::string(40, '7'));
     EXPECT_EQ("\r\n" + std::string(32, '7') + "\r\nOK\r\n", ask("AT*CIT_GACITF"));

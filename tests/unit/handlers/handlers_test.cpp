@@ -92,8 +92,10 @@ TEST_F(HandlerTest, SimSelectionFollowsTheSimCountAndC2kMode) {
     EXPECT_EQ("2", prop("persist.service.tolk.sim"));
     // Any number but 0 is C2K mode; 2^32 must not wrap to 0.
     ASSERT_EQ(0, property_set("ro.boot.opt_c2k_lte_mode", "4294967296"));
-    EXPECT_EQ(0, esuo("9", AT_SET_OP));
-    EXPECT_EQ("9", prop("persist.service.tolk.sim"));
+    for (const char *sim : {"5", "4", "9"}) {
+        EXPECT_EQ(0, esuo(sim, AT_SET_OP));
+        EXPECT_EQ(std::to_string(*sim == '9' ? 9 : *sim - '4'), prop("persist.service.tolk.sim")) << sim;
+    }
     EXPECT_EQ(4, esuo("6", AT_SET_OP)) << "no SIM 3 in C2K mode, even on a triple-SIM device";
     EXPECT_EQ("9", prop("persist.service.tolk.sim"));
     EXPECT_EQ(0, esuo("", AT_TEST_OP)) << "the test answer does not look at C2K mode";
