@@ -109,7 +109,7 @@ static int cclkSet(const char *param, char *response) {
         return RESPONSE_ERROR;
     }
     const bool hasInputTimeZone = len == CCLK_LEN_TZ;
-    LOGD("hasInputTimeZone %d", hasInputTimeZone ? 1 : 0);
+    LOGD("hasInputTimeZone %d", hasInputTimeZone);
 
     int fields[CCLK_FIELD_COUNT];
     int zone = 0;
