@@ -293,7 +293,7 @@ int exchangeWithGenericService(const char *cmd, char *finalLine, int size) {
     size_t lineStart = 0;
     size_t finalAt = 0, finalLen = 0, restAt = 0;  // restAt 0: no final line yet
     int waitMs = -1;  // the answer itself is waited for without limit
-    while (restAt == 0 && len < MAX_DATA_LEN) {
+    while (len < MAX_DATA_LEN) {
         struct pollfd p = {s_fdService_command, POLLIN, 0};
         int rc = poll(&p, 1, waitMs);
         if (rc < 0 && errno == EINTR) continue;
@@ -324,6 +324,7 @@ int exchangeWithGenericService(const char *cmd, char *finalLine, int size) {
                 restAt = 0;
             }
         }
+        if (restAt != 0) break;
     }
     size_t infoStart = 0, infoEnd = restAt != 0 ? finalAt : len;
     while (infoStart < infoEnd && (buf[infoStart] == '\r' || buf[infoStart] == '\n')) infoStart++;
