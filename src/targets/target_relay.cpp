@@ -296,8 +296,8 @@ int exchangeWithGenericService(const char *cmd, char *finalLine, int size) {
     while (len < MAX_DATA_LEN) {
         struct pollfd p = {s_fdService_command, POLLIN, 0};
         int rc = poll(&p, 1, waitMs);
-        if (rc < 0 && errno == EINTR) continue;
         if (rc == 0) break;
+        // A failed poll leaves its errno for the check below (EINTR: wait again).
         ssize_t n = rc > 0 ? recv(s_fdService_command, buf + len, MAX_DATA_LEN - len, 0) : -1;
         if (n < 0 && errno == EINTR) continue;
         if (n <= 0) {
@@ -316,7 +316,7 @@ int exchangeWithGenericService(const char *cmd, char *finalLine, int size) {
             if (lineLen > 0 && line[lineLen - 1] == '\r') lineLen--;
             restAt = (size_t)(nl - buf) + 1;
             if ((lineLen == 2 && strncmp(line, "OK", 2) == 0) || (lineLen == 5 && strncmp(line, "ERROR", 5) == 0) ||
-                strncmp(line, "+CME ERROR:", 11) == 0 || strncmp(line, "+CMS ERROR:", 11) == 0) {
+                strncmp(line, "+CME ERROR:", 11) == 0) {
                 finalAt = lineStart;
                 finalLen = lineLen;
             } else {
