@@ -288,7 +288,7 @@ int exchangeWithGenericService(const char *cmd, char *finalLine, int size) {
     if (s_fdService_command < 0) return -1;
     sendDataToGenericService(cmd);
 
-    char buf[DATA_BUF_SIZE];
+    char buf[MAX_DATA_LEN];
     size_t len = 0;
     size_t lineStart = 0;
     size_t finalAt = 0, finalLen = 0, restAt = 0;  // restAt 0: no final line yet
@@ -302,15 +302,12 @@ int exchangeWithGenericService(const char *cmd, char *finalLine, int size) {
         if (n < 0 && errno == EINTR) continue;
         if (n <= 0) {
             LOGE("generic service link ended while answering %s. errno = %d", cmd, errno);
-            close(s_fdService_command);
-            s_fdService_command = -1;
-            if (len == 0) return -1;
+            closeLink(&s_fdService_command);
             break;
         }
         len += (size_t)n;
-        buf[len] = '\0';
         waitMs = GENERIC_ANSWER_PIECE_WAIT_MS;
-        for (char *nl; restAt == 0 && (nl = strchr(buf + lineStart, '\n')) != NULL;) {
+        for (char *nl; restAt == 0 && (nl = (char *)memchr(buf + lineStart, '\n', len - lineStart)) != NULL;) {
             const char *line = buf + lineStart;
             size_t lineLen = (size_t)(nl - line);
             if (lineLen > 0 && line[lineLen - 1] == '\r') lineLen--;

@@ -16,8 +16,8 @@ int sendDataToGenericService(const char *data);
 int sendDataToAudio(const char *data, int len, int target);
 // Sends cmd to the generic service and relays its answer to the host, all but
 // its final result line, which is stored in finalLine ("OK", "ERROR",
-// "+CME ERROR: 3"; empty when the answer had none). Returns 0, or -1 when there
-// is no link or it failed before any answer came.
+// "+CME ERROR: 3"; empty when the answer had none or the link ended first).
+// Returns 0, or -1 when there is no link to the service.
 int exchangeWithGenericService(const char *cmd, char *finalLine, int size);
 
 #endif
