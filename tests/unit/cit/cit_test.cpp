@@ -100,12 +100,15 @@ TEST_F(CitLocal, FlagWritesAnswerOkOnlyWhenStored) {
 // and one that can be neither opened nor created answers ERROR: root_faults.tx.
 TEST_F(CitLocal, ResultFileEdges) {
     // An existing file keeps its other characters; only character 7 changes, and
-    // a file of 7 characters has room for it. Nothing is left open.
+    // a file of 7 characters has room for it; a shorter one is written whole.
+    // Nothing is left open.
     const size_t fds = std::distance(std::filesystem::directory_iterator("/proc/self/fd"), {});
-    for (const char *before : {"y1234560tail", "y123456"}) {
-        root.write(CIT_RESULT_FILE, before);
+    const std::pair<const char *, const char *> files[] = {
+        {"y1234560tail", "y1234561tail"}, {"y123456", "y1234561"}, {"abcdef", "x0000001"}};
+    for (const auto &f : files) {
+        root.write(CIT_RESULT_FILE, f.first);
         EXPECT_EQ("\r\nOK\r\n", ask("AT*CIT_WCITF"));
-        EXPECT_EQ(std::string(before).replace(7, 1, "1"), root.read(CIT_RESULT_FILE));
+        EXPECT_EQ(f.second, root.read(CIT_RESULT_FILE));
     }
     EXPECT_EQ(fds, std::distance(std::filesystem::directory_iterator("/proc/self/fd"), {}));
     // A disk that takes nothing more (a file size limit of 0): no result is stored.
