@@ -4,6 +4,9 @@
 #include "attok/at_tok.h"
 
 #include <ctype.h>
+#include <errno.h>
+#include <limits.h>
+#include <stdint.h>
 #include <stdlib.h>
 #include <string.h>
 
@@ -20,7 +23,9 @@ int at_tok_start_flag(char **cursor, char c) {
 }
 
 // Cuts the next token out of the line and returns it, or NULL for a used-up cursor.
-static char *nextTok(char **cursor) {
+// *whole, when given, becomes false for a quoted token whose closing quote is
+// missing or followed by other text than blanks before the next comma.
+static char *nextTok(char **cursor, bool *whole = NULL) {
     if (cursor == NULL || *cursor == NULL) return NULL;
     char *p = *cursor;
     while (*p != '\0' && isspace((unsigned char)*p)) p++;
@@ -29,6 +34,7 @@ static char *nextTok(char **cursor) {
         char *token = p + 1;
         char *close = strchr(token, '"');
         if (close == NULL) {
+            if (whole != NULL) *whole = false;
             *cursor = NULL;
             return token;
         }
@@ -36,6 +42,9 @@ static char *nextTok(char **cursor) {
         // Whatever stands between the closing quote and the next comma is skipped.
         char *rest = close + 1;
         char *comma = strchr(rest, ',');
+        for (char *q = rest; whole != NULL && *q != '\0' && q != comma; q++) {
+            if (!isspace((unsigned char)*q)) *whole = false;
+        }
         *cursor = comma != NULL ? comma + 1 : rest + strlen(rest);
         return token;
     }
@@ -68,6 +77,37 @@ int at_tok_nextint64(char **cursor, int64_t *out) {
     const long long value = strtoll(token, &end, 10);
     if (out != NULL) *out = (int64_t)value;
     return end == token ? -1 : 0;
+}
+
+// The token as one whole decimal number between min and max.
+static int wholeNumber(char **cursor, long long min, long long max, long long *value) {
+    bool whole = true;
+    char *token = nextTok(cursor, &whole);
+    if (token == NULL) return AT_TOK_EMPTY;
+    while (isspace((unsigned char)*token)) token++;
+    if (*token == '\0') return AT_TOK_EMPTY;
+    char *end = NULL;
+    errno = 0;
+    const long long v = strtoll(token, &end, 10);
+    if (end == token) return AT_TOK_NO_NUMBER;
+    while (isspace((unsigned char)*end)) end++;
+    if (!whole || *end != '\0' || errno == ERANGE || v < min || v > max) return AT_TOK_NOT_WHOLE;
+    *value = v;
+    return 0;
+}
+
+int at_tok_nextint_strict(char **cursor, int *out) {
+    long long v = 0;
+    int rc = wholeNumber(cursor, INT_MIN, INT_MAX, &v);
+    if (rc == 0 && out != NULL) *out = (int)v;
+    return rc;
+}
+
+int at_tok_nextint64_strict(char **cursor, int64_t *out) {
+    long long v = 0;
+    int rc = wholeNumber(cursor, INT64_MIN, INT64_MAX, &v);
+    if (rc == 0 && out != NULL) *out = (int64_t)v;
+    return rc;
 }
 
 int at_tok_nextstr(char **cursor, char **out) {

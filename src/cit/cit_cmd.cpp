@@ -17,6 +17,7 @@
 #include <cutils/properties.h>
 #include <cutils/sockets.h>
 
+#include "attok/at_tok.h"
 #include "cit/pro_info.h"
 #include "core/tolkd_log.h"
 #include "handlers/handlers.h"
@@ -64,14 +65,28 @@ void answer(const char *text, int len) { writeDataToSerial(text, len); }
 
 void answerText(const char *text) { writeDataToSerial(text, (int)strlen(text)); }
 
-// Index and value parameters read like atoi, but an overflowing number turns into
-// one that is out of range instead of undefined behaviour.
-long parseNumber(const char *text) { return strtol(text, nullptr, 10); }
+// Answers ERROR; gives the handler result of a command that was answered.
+int answerError(void) {
+    answer(kAnswerError, (int)strlen(kAnswerError));
+    return 0;
+}
 
-bool validFlagIndex(long index) { return index >= 0 && index < PRODUCT_INFO_SIZE; }
+// The next parameter of a flag command: one whole decimal number from 0 to max,
+// blanks around it allowed. A station records every OK, so a typo must never
+// stand for an index or a value.
+bool flagNumber(char **cursor, int max, int *out) {
+    int v = 0;
+    if (at_tok_nextint_strict(cursor, &v) != 0 || v < 0 || v > max) return false;
+    *out = v;
+    return true;
+}
 
+// A run that did not start is not answered as started.
 int cit_start_handler(char *) {
-    property_set(kRunningProp, "1");
+    if (property_set(kRunningProp, "1") != 0) {
+        NLOGE("set %s fails", kRunningProp);
+        return answerError();
+    }
     char value[PROPERTY_VALUE_MAX] = {0};
     property_get(kRunningProp, value, "2");
     NLOGD("%s = %s", kRunningProp, value);
@@ -91,9 +106,12 @@ int cit_shutdown_handler(char *) {
     return 0;
 }
 
+// A flag that could not be read answers ERROR: the fallback of an unreadable
+// record must not pass for a stored result.
 int cit_readmmi1_handler(char *) {
     int flag = getFlag(FLAG_MMI1_RESULT);
     NLOGD("(%d)==%d", FLAG_MMI1_RESULT, flag);
+    if (flag < 0) return answerError();
     const char *mark = flag == 0 ? "F" : (flag == 1 ? "P" : "");
     char buf[64];
     snprintf(buf, sizeof(buf), "MMI1 _%s%s", mark, kAnswerOk);
@@ -104,6 +122,7 @@ int cit_readmmi1_handler(char *) {
 int cit_readuserat_handler(char *) {
     int flag = getFlag(FLAG_USER_AT);
     NLOGD("(%d)==%d", FLAG_USER_AT, flag);
+    if (flag < 0) return answerError();
     const char *mark = flag == 0 ? "0" : (flag == 1 ? "1" : "");
     char buf[64];
     snprintf(buf, sizeof(buf), "UserAT =%s%s", mark, kAnswerOk);
@@ -113,10 +132,7 @@ int cit_readuserat_handler(char *) {
 
 // A pass is answered only for a flag that reached the store: the station records it.
 int cit_writeuserat_handler(char *) {
-    if (setFlag(FLAG_USER_AT, 0) != 0) {
-        answer(kAnswerError, 9);
-        return 0;
-    }
+    if (setFlag(FLAG_USER_AT, 0) != 0) return answerError();
     NLOGD("(%d)==%d", FLAG_USER_AT, getFlag(FLAG_USER_AT));
     answer("WriteUserAT Pass\r\nOK\r\n", 22);
     return 0;
@@ -124,6 +140,7 @@ int cit_writeuserat_handler(char *) {
 
 int cit_readreset_handler(char *) {
     int flag = getFlag(FLAG_RESET_STATE);
+    if (flag < 0) return answerError();
     const char *mark = "";
     if (flag == 'b') {
         NLOGD("(208)=='b'");
@@ -141,54 +158,40 @@ int cit_readreset_handler(char *) {
     return 0;
 }
 
-// A missing "=" or an index outside the record is refused: nothing may be read
-// from beyond the 1024 bytes.
+// "=index": the index must be a whole number within the record, and nothing may
+// follow it; anything else is refused, as is a flag that could not be read.
 int cit_readproinfo_handler(char *line) {
-    const char *eq = strchr(line, '=');
-    if (eq == nullptr) {
-        NLOGE("no index given");
-        answer(kAnswerError, 9);
-        return 0;
+    char *cursor = line;
+    int index = 0;
+    if (at_tok_start_flag(&cursor, '=') < 0 || !flagNumber(&cursor, PRODUCT_INFO_SIZE - 1, &index) ||
+        at_tok_hasmore(&cursor)) {
+        NLOGE("no flag index in %s", line);
+        return answerError();
     }
-    long index = parseNumber(eq + 1);
-    NLOGD("Index = %d", (int)index);
-    if (!validFlagIndex(index)) {
-        NLOGE("index %ld outside the record", index);
-        answer(kAnswerError, 9);
-        return 0;
-    }
+    NLOGD("Index = %d", index);
+    int flag = getFlag(index);
+    if (flag < 0) return answerError();
     char buf[64];
-    snprintf(buf, sizeof(buf), "Result=%d%s", getFlag((int)index), kAnswerOk);
+    snprintf(buf, sizeof(buf), "Result=%d%s", flag, kAnswerOk);
     answerText(buf);
     return 0;
 }
 
-// "=index,value": the low 8 bits of value go into flag index. A line without "="
-// or "," gets no answer at all; an index outside the record, or a value that did
-// not reach the store, is answered with an error.
+// "=index,value": both whole numbers, the index within the record and the value a
+// byte. Anything else, and a value that did not reach the store, is answered with
+// an error and stores nothing.
 int cit_writeproinfo_handler(char *line) {
-    char *eq = strchr(line, '=');
-    char *comma = strchr(line, ',');
-    if (eq == nullptr || comma == nullptr) {
-        NLOGE("missing \"=\" or \",\": %s", line);
-        return 0;
+    char *cursor = line;
+    int index = 0;
+    int value = 0;
+    if (at_tok_start_flag(&cursor, '=') < 0 || !flagNumber(&cursor, PRODUCT_INFO_SIZE - 1, &index) ||
+        !flagNumber(&cursor, FLAG_VALUE_MAX, &value) || at_tok_hasmore(&cursor)) {
+        NLOGE("no flag index and value in %s", line);
+        return answerError();
     }
-    long value = parseNumber(comma + 1);
-    *comma = '\0';
-    long index = parseNumber(eq + 1);
-    NLOGD("str1 = %s", eq + 1);
-    NLOGD("str2 = %s", comma + 1);
-    NLOGD("index = %d", (int)index);
-    NLOGD("flag = %d", (int)value);
-    if (!validFlagIndex(index)) {
-        NLOGE("index %ld outside the record", index);
-        answer(kAnswerError, 9);
-        return 0;
-    }
-    if (setFlag((int)index, (unsigned char)(value & 0xFF)) != 0) {
-        answer(kAnswerError, 9);
-        return 0;
-    }
+    NLOGD("index = %d", index);
+    NLOGD("flag = %d", value);
+    if (setFlag(index, (unsigned char)value) != 0) return answerError();
     answer(kAnswerOk, 6);
     return 0;
 }
@@ -212,36 +215,33 @@ int cit_gacitf_handler(char *) {
 // Character 7 of the result file holds the CIT result. An existing file is changed
 // in place; a missing one, or one too short to hold character 7 (seeking past its
 // end would fill the gap with NUL bytes), is written whole.
-int cit_write_result(char result) {
-    bool done = false;
+bool writeResultInPlace(char result) {
     FILE *f = fopen(CIT_RESULT_FILE, "r+");
-    if (f != nullptr) {
-        if (fseek(f, 0, SEEK_END) == 0 && ftell(f) >= 7 && fseek(f, 7, SEEK_SET) == 0) {
-            bool put = fputc(result, f) != EOF;
-            done = (fclose(f) == 0) && put;
-            f = nullptr;
-            if (!done) NLOGE("update of %s fails errno %d", CIT_RESULT_FILE, errno);
-        } else {
-            fclose(f);
-            f = nullptr;
-        }
+    if (f == nullptr) return false;
+    if (fseek(f, 0, SEEK_END) != 0 || ftell(f) < 7 || fseek(f, 7, SEEK_SET) != 0) {
+        fclose(f);
+        return false;
     }
-    if (!done) {
-        f = fopen(CIT_RESULT_FILE, "w");
-        if (f == nullptr) {
-            NLOGE("create %s fails errno %d", CIT_RESULT_FILE, errno);
-            answer(kAnswerError, 9);
-            return 0;
-        }
-        const char *whole = result == '1' ? "x0000001" : "x0000000";
-        bool put = fputs(whole, f) != EOF;
-        done = (fclose(f) == 0) && put;
-        if (!done) {
-            NLOGE("write of %s fails errno %d", CIT_RESULT_FILE, errno);
-            answer(kAnswerError, 9);
-            return 0;
-        }
+    bool put = fputc(result, f) != EOF;
+    bool done = (fclose(f) == 0) && put;
+    if (!done) NLOGE("update of %s fails errno %d", CIT_RESULT_FILE, errno);
+    return done;
+}
+
+bool writeResultWhole(char result) {
+    FILE *f = fopen(CIT_RESULT_FILE, "w");
+    if (f == nullptr) {
+        NLOGE("create %s fails errno %d", CIT_RESULT_FILE, errno);
+        return false;
     }
+    bool put = fputs(result == '1' ? "x0000001" : "x0000000", f) != EOF;
+    bool done = (fclose(f) == 0) && put;
+    if (!done) NLOGE("write of %s fails errno %d", CIT_RESULT_FILE, errno);
+    return done;
+}
+
+int cit_write_result(char result) {
+    if (!writeResultInPlace(result) && !writeResultWhole(result)) return answerError();
     sync();
     answer(kAnswerOk, 6);
     return 0;

@@ -27,10 +27,12 @@ bool readRecord(const F_ID &fid, unsigned char *record) {
 
 }  // namespace
 
+// A flag that cannot be read has no value: -1, never a fallback byte that the
+// station would take for a stored one.
 int getFlag(int index) {
     if (!validIndex(index)) {
         NLOGE("Invalid flag index %d", index);
-        return 255;
+        return -1;
     }
 
     int recSize = 0;
@@ -38,24 +40,24 @@ int getFlag(int index) {
     F_ID fid = NVM_GetFileDesc(PRODUCT_INFO_FILE_NO, &recSize, &recNum, false);
     if (fid.iFileDesc < 0) {
         NLOGE("NVM_GetFileDesc is fails errno %d\n", errno);
-        return 0;
+        return -1;
     }
     if (recNum != 1) {
         NLOGE("Unexpected record num %d", recNum);
         NVM_CloseFileDesc(fid);
-        return 255;
+        return -1;
     }
     if (recSize != PRODUCT_INFO_SIZE) {
         NLOGE("Unexpected record size %d PRODUCT_INFO %d", recSize, PRODUCT_INFO_SIZE);
         NVM_CloseFileDesc(fid);
-        return 255;
+        return -1;
     }
 
     unsigned char record[PRODUCT_INFO_SIZE];
     if (!readRecord(fid, record)) {
         NLOGE("Read NVRAM fails errno %d\n", errno);
         NVM_CloseFileDesc(fid);
-        return 255;
+        return -1;
     }
     NVM_CloseFileDesc(fid);
     return record[index];

@@ -1,6 +1,6 @@
 // Battery ADC commands AT@GCSF, AT@GBV and AT@SCC. They answer with their own
 // final result text and ignore the operation form: AT@GBV, AT@GBV? and AT@GBV=1
-// all read the battery.
+// all read the battery. Only AT@SCC, which drives the charger, tells them apart.
 #include "dispatch/bat_cmd.h"
 
 #include <fcntl.h>
@@ -71,14 +71,15 @@ int handleBatCmd(const char *line, int code) {
         return answerNumber(average);
     }
     case BAT_CMD_SCC: {
+        // Asking about the charger setting (AT@SCC?, AT@SCC=?) must not change it;
+        // there is nothing to read back.
+        if (line == NULL || strchr(line, '?') != NULL) return answerError();
+        // The station records the 0 as a charger that took the setting.
         int fd = openAdcDevice();
-        if (fd >= 0) {
-            int value = ADC_SET_VALUE;
-            ioctl(fd, ADC_SET_IOCTL, &value);
-            close(fd);
-        }
-        // The station only needs the command acknowledged.
-        return answerNumber(0);
+        int value = ADC_SET_VALUE;
+        bool set = fd >= 0 && ioctl(fd, ADC_SET_IOCTL, &value) == 0;
+        if (fd >= 0) close(fd);
+        return set ? answerNumber(0) : answerError();
     }
     default:
         return answerError();

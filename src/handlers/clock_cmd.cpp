@@ -1,6 +1,7 @@
 // Clock commands: AT+CCLK reads and sets the system clock, AT+CSDF chooses the
 // date format of the AT+CCLK read answer. The clock is kept and reported in UTC;
 // the zone a set command carries is only stored and echoed back by later reads.
+#include <ctype.h>
 #include <errno.h>
 #include <stdio.h>
 #include <stdlib.h>
@@ -26,6 +27,8 @@ int gCclkTz = 65535;
 #define CCLK_WORK_SIZE 40
 #define CCLK_LEN_NO_TZ 17  // yy/MM/dd,hh:mm:ss
 #define CCLK_LEN_TZ 20     // yy/MM/dd,hh:mm:ss followed by +zz or -zz
+#define CCLK_BASE_YEAR 2000
+enum { CCLK_YEAR, CCLK_MONTH, CCLK_DAY, CCLK_HOUR, CCLK_MINUTE, CCLK_SECOND, CCLK_FIELD_COUNT };
 
 #define CSDF_MODE_MAX 7
 #define CSDF_AUXMODE_MAX 2
@@ -41,6 +44,62 @@ static size_t cleanClockValue(const char *in, char *out, size_t size) {
     return n;
 }
 
+// Two decimal digits, nothing else: a field of the clock value.
+static bool twoDigits(const char *p, int *out) {
+    if (!isdigit((unsigned char)p[0]) || !isdigit((unsigned char)p[1])) return false;
+    *out = (p[0] - '0') * 10 + (p[1] - '0');
+    return true;
+}
+
+// The fields as a calendar time in UTC; two-digit years count from 2000.
+static void clockTime(const int f[CCLK_FIELD_COUNT], struct tm *tm) {
+    memset(tm, 0, sizeof(*tm));
+    tm->tm_year = CCLK_BASE_YEAR - 1900 + f[CCLK_YEAR];
+    tm->tm_mon = f[CCLK_MONTH] - 1;
+    tm->tm_mday = f[CCLK_DAY];
+    tm->tm_hour = f[CCLK_HOUR];
+    tm->tm_min = f[CCLK_MINUTE];
+    tm->tm_sec = f[CCLK_SECOND];
+}
+
+// yy/MM/dd,hh:mm:ss, then with a zone its sign and two digits. Every field must be
+// there in full: a field that did not scan would set a time nobody asked for.
+static bool scanClockValue(const char *value, bool hasZone, int fields[CCLK_FIELD_COUNT], int *zone) {
+    static const char kSeparators[] = "//,::";
+    for (int i = 0; i < CCLK_FIELD_COUNT; i++) {
+        const char *p = value + 3 * i;
+        if (!twoDigits(p, &fields[i])) return false;
+        if (i < CCLK_FIELD_COUNT - 1 && p[2] != kSeparators[i]) return false;
+    }
+    if (!hasZone) return true;
+    const char *z = value + CCLK_LEN_NO_TZ;
+    if ((z[0] != '+' && z[0] != '-') || !twoDigits(z + 1, zone)) return false;
+    if (z[0] == '-') *zone = -*zone;
+    return true;
+}
+
+// Days in a month (1..12): day 0 of the next month, which is the last of this one.
+static int daysInMonth(int year, int month) {
+    struct tm last;
+    memset(&last, 0, sizeof(last));
+    last.tm_year = year - 1900;
+    last.tm_mon = month;
+    (void)timegm(&last);
+    return last.tm_mday;
+}
+
+// A real date and time. Kept from the looser check stations may rely on: second 60
+// (a leap second, set as the next minute's first) and 24:00:00 (the end of a day,
+// set as the next day's start); nothing else may roll over into another time.
+static bool validClockFields(const int f[CCLK_FIELD_COUNT]) {
+    const int month = f[CCLK_MONTH], day = f[CCLK_DAY];
+    if (month < 1 || month > 12 || day < 1 || day > daysInMonth(CCLK_BASE_YEAR + f[CCLK_YEAR], month)) return false;
+    const int hour = f[CCLK_HOUR], minute = f[CCLK_MINUTE], second = f[CCLK_SECOND];
+    if (minute > 59 || second > 60) return false;
+    return hour < 24 || (hour == 24 && minute == 0 && second == 0);
+}
+
+// A refused value changes nothing: neither the clock nor the stored zone.
 static int cclkSet(const char *param, char *response) {
     char value[CCLK_WORK_SIZE];
     size_t len = cleanClockValue(param, value, sizeof(value));
@@ -49,50 +108,30 @@ static int cclkSet(const char *param, char *response) {
                  (unsigned long)strlen(param), param, (unsigned long)len, value);
         return RESPONSE_ERROR;
     }
-    int hasInputTimeZone = (len == CCLK_LEN_TZ) ? 1 : 0;
+    const bool hasInputTimeZone = len == CCLK_LEN_TZ;
     LOGD("hasInputTimeZone %d", hasInputTimeZone);
 
-    int year = 0, month = 0, day = 0, hour = 0, minute = 0, second = 0, zone = 0;
-    if (hasInputTimeZone) {
-        sscanf(value, "%2d/%2d/%2d,%2d:%2d:%2d%3d", &year, &month, &day, &hour, &minute, &second, &zone);
-        if (zone < CCLK_TZ_MIN || zone > CCLK_TZ_MAX) return RESPONSE_ERROR;
-        // Kept even if the date or time below turns out to be wrong.
-        gCclkTz = zone;
-        LOGD("Input time zone:%02d", zone);
-    } else {
-        sscanf(value, "%2d/%2d/%2d,%2d:%2d:%2d", &year, &month, &day, &hour, &minute, &second);
-    }
-
-    if (year < 0 || month < 1 || month > 12 || day < 1 || day > 31 || hour < 0 || hour > 24 || minute < 0 ||
-        minute > 60 || second < 0 || second > 60) {
+    int fields[CCLK_FIELD_COUNT];
+    int zone = 0;
+    if (!scanClockValue(value, hasInputTimeZone, fields, &zone) || zone < CCLK_TZ_MIN || zone > CCLK_TZ_MAX ||
+        !validClockFields(fields)) {
         LOGE("Input format error");
         return RESPONSE_ERROR;
     }
+    if (hasInputTimeZone) LOGD("Input time zone:%02d", zone);
 
     struct tm tm;
-    memset(&tm, 0, sizeof(tm));
-    tm.tm_year = year + 100;  // two-digit years count from 2000
-    tm.tm_mon = month - 1;
-    tm.tm_mday = day;
-    tm.tm_hour = hour;
-    tm.tm_min = minute;
-    tm.tm_sec = second;
-    tm.tm_isdst = 0;
+    clockTime(fields, &tm);
     // timegm reads the time as UTC without touching TZ: the radio HAL's threads
     // format log times while this runs, and the environment is not thread-safe.
-    time_t seconds = timegm(&tm);
-    if (seconds < 0) {
-        LOGD("mktime error: %d %s\n", errno, strerror(errno));
-        return RESPONSE_ERROR;
-    }
-
     struct timeval tv;
-    tv.tv_sec = seconds;
+    tv.tv_sec = timegm(&tm);
     tv.tv_usec = 0;
     if (settimeofday(&tv, NULL) != 0) {
         LOGD("Unable to set clock to %d.%d: %s\n", (int)tv.tv_sec, (int)tv.tv_usec, strerror(errno));
         return RESPONSE_ERROR;
     }
+    if (hasInputTimeZone) gCclkTz = zone;
     return RESPONSE_OK;
 }
 
@@ -153,6 +192,17 @@ int pas_cclk_handler(const char *param, int opType, char *response) {
     }
 }
 
+// One field of AT+CSDF=: empty (it keeps *value, the default) or a whole number
+// from 1 to max. A typo must not select a format.
+static bool csdfField(char **cursor, int max, int *value) {
+    int v = 0;
+    int rc = at_tok_nextint_strict(cursor, &v);
+    if (rc == AT_TOK_EMPTY) return true;
+    if (rc != 0 || v < 1 || v > max) return false;
+    *value = v;
+    return true;
+}
+
 int pas_csdf_handler(const char *param, int opType, char *response) {
     const char *text = param != NULL ? param : "";
     LOGD("[pas_csdf_handler] cmdline %s", text);
@@ -161,16 +211,13 @@ int pas_csdf_handler(const char *param, int opType, char *response) {
         if (text[0] == '\0') return RESPONSE_ERROR;
         char buf[PARAM_BUF_SIZE];
         char *cursor = copyParam(text, buf, sizeof(buf));
+        // An empty field takes its default; anything else must be a whole number
+        // in range, or the command fails and changes nothing.
         int mode = 1;
-        bool modeOk = true;
-        // An empty or unreadable field takes its default; a readable one out of
-        // range fails the command.
-        if (at_tok_nextint(&cursor, &mode) < 0) mode = 1;
-        else if (mode < 1 || mode > CSDF_MODE_MAX) modeOk = false;
         int auxmode = 1;
-        if (at_tok_nextint(&cursor, &auxmode) < 0) auxmode = 1;
-        else if (auxmode < 1 || auxmode > CSDF_AUXMODE_MAX) return RESPONSE_ERROR;
-        if (!modeOk) return RESPONSE_ERROR;
+        if (!csdfField(&cursor, CSDF_MODE_MAX, &mode) || !csdfField(&cursor, CSDF_AUXMODE_MAX, &auxmode) ||
+            at_tok_hasmore(&cursor))
+            return RESPONSE_ERROR;
         gCsdfMode = mode;
         gCsdfAuxmode = auxmode;
         LOGD("[pas_csdf_handler] After set: mode %d, auxmode %d", gCsdfMode, gCsdfAuxmode);

@@ -38,6 +38,16 @@ static int esuoTest(const char *multiSim) {
     return RESPONSE_OK;
 }
 
+// Stores the slot choice; a choice the property store did not take is an error,
+// since the modem commands would still go to the old slot.
+static int setSimProperty(const char *slot) {
+    if (property_set(TOLK_SIM_PROPERTY, slot) != 0) {
+        LOGE("set %s to %s failed", TOLK_SIM_PROPERTY, slot);
+        return RESPONSE_ERROR;
+    }
+    return RESPONSE_OK;
+}
+
 // In C2K mode the first modem serves SIM 1 and SIM 2 and the third modem (9)
 // is the CDMA side; there is no SIM 3.
 static int esuoSetC2k(int value) {
@@ -45,16 +55,13 @@ static int esuoSetC2k(int value) {
     switch (value) {
     case 9:
         LOGD("C2K, setSocket to MD3");
-        property_set(TOLK_SIM_PROPERTY, "9");
-        return RESPONSE_OK;
+        return setSimProperty("9");
     case 5:
         LOGD("Set default to SIM2, setSocket to MD1");
-        property_set(TOLK_SIM_PROPERTY, "1");
-        return RESPONSE_OK;
+        return setSimProperty("1");
     case 4:
         LOGD("Set default to SIM1, setSocket to MD1");
-        property_set(TOLK_SIM_PROPERTY, "0");
-        return RESPONSE_OK;
+        return setSimProperty("0");
     default:
         return RESPONSE_ERROR;
     }
@@ -63,22 +70,19 @@ static int esuoSetC2k(int value) {
 static int esuoSet(const char *multiSim, int value) {
     switch (value) {
     case 4:
-        property_set(TOLK_SIM_PROPERTY, "0");
         LOGD("Set default to SIM1");
-        return RESPONSE_OK;
+        return setSimProperty("0");
     case 5:
         if (strcmp(multiSim, "ss") == 0) {
             LOGD("Error single SIM.");
             return RESPONSE_ERROR;
         }
-        property_set(TOLK_SIM_PROPERTY, "1");
         LOGD("Set default to SIM2");
-        return RESPONSE_OK;
+        return setSimProperty("1");
     case 6:
         if (strcmp(multiSim, "tsts") == 0) {
-            property_set(TOLK_SIM_PROPERTY, "2");
             LOGD("Set default to SIM3");
-            return RESPONSE_OK;
+            return setSimProperty("2");
         }
         LOGD("Error: Not triple SIM.");
         return RESPONSE_ERROR;
@@ -101,10 +105,9 @@ int pas_esuo_handler(const char *param, int opType, char *response) {
     case AT_TEST_OP:
         return esuoTest(multiSim);
     case AT_SET_OP: {
-        char buf[PARAM_BUF_SIZE];
-        char *cursor = copyParam(param, buf, sizeof(buf));
         int value = 0;
-        if (at_tok_nextint(&cursor, &value) < 0) return RESPONSE_INVALID;
+        int rc = onlyParamNumber(param, &value, RESPONSE_ERROR);
+        if (rc != RESPONSE_OK) return rc;
         if (isCdmaLteDcSupport()) return esuoSetC2k(value);
         return esuoSet(multiSim, value);
     }

@@ -30,8 +30,22 @@ static const SwitchCmd kEurc = {"persist.service.tolk_urc.enable", "+EURC:1\r\n"
 static const SwitchCmd kTolk = {"persist.service.tolk.usermode", "+TOLK:1\r\n", "+TOLK:0\r\n",
                                 "+TOLK:invalid value.\r\n", "+TOLK:(0,1)"};
 
-// A set value other than 0 or 1 is accepted and ignored: stations send it to
-// probe the command and expect OK.
+// A switch takes 0 and 1. Any other whole number is accepted and ignored: stations
+// send one to probe the command and expect OK. Text that is no whole number is
+// refused like one without digits, and a value the property store did not take is
+// an error: the switch did not change.
+static int switchSet(const SwitchCmd *sw, const char *param) {
+    int value = 0;
+    int rc = onlyParamNumber(param, &value, RESPONSE_INVALID);
+    if (rc != RESPONSE_OK) return rc;
+    if (value != 0 && value != 1) return RESPONSE_OK;
+    if (property_set(sw->property, value == 1 ? "1" : "0") != 0) {
+        LOGE("set %s to %d failed", sw->property, value);
+        return RESPONSE_ERROR;
+    }
+    return RESPONSE_OK;
+}
+
 static int switchHandler(const SwitchCmd *sw, const char *param, int opType, char *response) {
     switch (opType) {
     case AT_READ_OP: {
@@ -44,15 +58,8 @@ static int switchHandler(const SwitchCmd *sw, const char *param, int opType, cha
     case AT_TEST_OP:
         writeDataToSerial(sw->range, (int)strlen(sw->range));
         return RESPONSE_OK;
-    case AT_SET_OP: {
-        char buf[PARAM_BUF_SIZE];
-        char *cursor = copyParam(param, buf, sizeof(buf));
-        int value = 0;
-        if (at_tok_nextint(&cursor, &value) < 0) return RESPONSE_INVALID;
-        if (value == 0) property_set(sw->property, "0");
-        else if (value == 1) property_set(sw->property, "1");
-        return RESPONSE_OK;
-    }
+    case AT_SET_OP:
+        return switchSet(sw, param);
     default:
         return RESPONSE_ERROR;
     }
@@ -80,10 +87,9 @@ int pas_vzwtolkcfg_handler(const char *param, int opType, char *response) {
         return RESPONSE_OK;
     }
     case AT_SET_OP: {
-        char buf[PARAM_BUF_SIZE];
-        char *cursor = copyParam(param, buf, sizeof(buf));
         int value = 0;
-        if (at_tok_nextint(&cursor, &value) < 0 || (value != 0 && value != 1)) return RESPONSE_ERROR;
+        if (onlyParamNumber(param, &value, RESPONSE_ERROR) != RESPONSE_OK || (value != 0 && value != 1))
+            return RESPONSE_ERROR;
         gVzwTolkCfg = value;
         return RESPONSE_OK;
     }
@@ -110,9 +116,10 @@ int pas_cmec_handler(const char *param, int opType, char *response) {
         // All four or nothing: a partial configuration is never applied.
         int values[CMEC_PARAM_COUNT];
         for (int i = 0; i < CMEC_PARAM_COUNT; i++) {
-            if (at_tok_nextint(&cursor, &values[i]) < 0) return RESPONSE_ERROR;
+            if (nextParamNumber(&cursor, &values[i], RESPONSE_ERROR) != RESPONSE_OK) return RESPONSE_ERROR;
             if (values[i] < 0 || values[i] > CMEC_MAX_VALUE) return RESPONSE_ERROR;
         }
+        if (at_tok_hasmore(&cursor)) return RESPONSE_ERROR;
         for (int i = 0; i < CMEC_PARAM_COUNT; i++) gCmecConfig[i] = values[i];
         return RESPONSE_OK;
     }

@@ -27,20 +27,17 @@ int pas_usbTethering_handler(const char *param, int opType, char *response) {
         return RESPONSE_OK;
     }
     case AT_SET_OP: {
-        char buf[PARAM_BUF_SIZE];
-        char *cursor = copyParam(param, buf, sizeof(buf));
         int value = 0;
-        if (at_tok_nextint(&cursor, &value) < 0) return RESPONSE_INVALID;
-        if (value == 0) {
-            property_set(USB_TETHERING_PROPERTY, "0");
-            return RESPONSE_OK;
+        int rc = onlyParamNumber(param, &value, RESPONSE_ERROR);
+        if (rc != RESPONSE_OK) return rc;
+        if (value != 0 && value != 1) return RESPONSE_ERROR;
+        // A flag the property store did not take was not switched.
+        if (property_set(USB_TETHERING_PROPERTY, value == 1 ? "1" : "0") != 0) {
+            LOGE("set %s to %d failed", USB_TETHERING_PROPERTY, value);
+            return RESPONSE_ERROR;
         }
-        if (value == 1) {
-            property_set(USB_TETHERING_PROPERTY, "1");
-            LOGD("set usbTethering to 1");
-            return RESPONSE_OK;
-        }
-        return RESPONSE_ERROR;
+        LOGD("set usbTethering to %d", value);
+        return RESPONSE_OK;
     }
     default:
         return RESPONSE_ERROR;

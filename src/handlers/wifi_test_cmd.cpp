@@ -31,19 +31,47 @@ int wifiTxPower = 0;
 #define WIFI_MODE_MAX 4
 #define WIFI_ADDR_LEN 6
 
-// Reads the first integer of a set form; false when it does not parse.
-static bool firstInt(const char *param, char *buf, size_t size, char **cursor, int *value) {
-    *cursor = copyParam(param, buf, size);
-    *value = 0;
-    return at_tok_nextint(cursor, value) == 0;
+// Hands Wi-Fi to the framework ("AT+WITOF=2") or takes it back ("AT+WITOF=1") and
+// judges the service's answer. Its information text is shown to the host; its
+// final result is not, so that the command ends with exactly one, its own.
+static bool askFramework(const char *cmd) {
+    char finalLine[DATA_BUF_SIZE];
+    return exchangeWithGenericService(cmd, finalLine, (int)sizeof(finalLine)) == 0 && strcmp(finalLine, "OK") == 0;
 }
 
-// Asks the generic service to switch Wi-Fi and waits for its answer, which is
-// relayed to the host; true when the answer holds OK.
-static bool askFramework(const char *cmd) {
-    if (s_fdService_command < 0) connectTarget(GENERIC_TYPE);
-    sendDataToGenericService(cmd);
-    return serviceReaderLoopWithResult(cmd) != -1;
+// The state always names who holds the chip. Wi-Fi goes to the framework only with
+// the device under test closed, and the test device opens only once the framework
+// has let Wi-Fi go: the two never hold the chip at once.
+static int wifiHandOver(int target) {
+    switch (target) {
+    case WIFI_STATE_TEST:
+        if (wifiEnableState == WIFI_STATE_FRAMEWORK) {
+            if (!askFramework("AT+WITOF=1")) return RESPONSE_ERROR;
+            wifiEnableState = WIFI_STATE_OFF;
+        }
+        if (!WIFI_TEST_OpenDUT()) return RESPONSE_ERROR;
+        break;
+    case WIFI_STATE_FRAMEWORK:
+        if (wifiEnableState == WIFI_STATE_TEST) {
+            if (!WIFI_TEST_CloseDUT()) return RESPONSE_ERROR;
+            wifiEnableState = WIFI_STATE_OFF;
+        }
+        if (!askFramework("AT+WITOF=2")) return RESPONSE_ERROR;
+        break;
+    case WIFI_STATE_OFF:
+        // Wi-Fi that the framework switched on is switched off by it too; from
+        // any other state the device under test is closed.
+        if (wifiEnableState == WIFI_STATE_FRAMEWORK) {
+            if (!askFramework("AT+WITOF=1")) return RESPONSE_ERROR;
+        } else if (!WIFI_TEST_CloseDUT()) {
+            return RESPONSE_ERROR;
+        }
+        break;
+    default:
+        return RESPONSE_ERROR;
+    }
+    wifiEnableState = target;
+    return RESPONSE_OK;
 }
 
 int pas_wienable_handler(const char *param, int opType, char *response) {
@@ -52,33 +80,9 @@ int pas_wienable_handler(const char *param, int opType, char *response) {
         return RESPONSE_OK;
     }
     if (opType != AT_SET_OP) return RESPONSE_ERROR;
-
-    char buf[PARAM_BUF_SIZE];
-    char *cursor;
-    int value;
-    if (!firstInt(param, buf, sizeof(buf), &cursor, &value)) return RESPONSE_INVALID;
-    switch (value) {
-    case 2:
-        if (!WIFI_TEST_OpenDUT()) return RESPONSE_ERROR;
-        wifiEnableState = WIFI_STATE_TEST;
-        return RESPONSE_OK;
-    case 1:
-        if (!askFramework("AT+WITOF=2")) return RESPONSE_ERROR;
-        wifiEnableState = WIFI_STATE_FRAMEWORK;
-        return RESPONSE_OK;
-    case 0:
-        // Wi-Fi that the framework switched on is switched off by it too; from
-        // any other state the device under test is closed.
-        if (wifiEnableState == WIFI_STATE_FRAMEWORK) {
-            if (!askFramework("AT+WITOF=1")) return RESPONSE_ERROR;
-        } else if (!WIFI_TEST_CloseDUT()) {
-            return RESPONSE_ERROR;
-        }
-        wifiEnableState = WIFI_STATE_OFF;
-        return RESPONSE_OK;
-    default:
-        return RESPONSE_ERROR;
-    }
+    int value = 0;
+    int rc = onlyParamNumber(param, &value, RESPONSE_ERROR);
+    return rc != RESPONSE_OK ? rc : wifiHandOver(value);
 }
 
 int pas_wimode_handler(const char *param, int opType, char *response) {
@@ -90,10 +94,9 @@ int pas_wimode_handler(const char *param, int opType, char *response) {
     }
     if (opType != AT_SET_OP) return RESPONSE_ERROR;
 
-    char buf[PARAM_BUF_SIZE];
-    char *cursor;
-    int value;
-    if (!firstInt(param, buf, sizeof(buf), &cursor, &value)) return RESPONSE_INVALID;
+    int value = 0;
+    int rc = onlyParamNumber(param, &value, RESPONSE_ERROR);
+    if (rc != RESPONSE_OK) return rc;
     if (value < 0 || value > WIFI_MODE_MAX) return RESPONSE_ERROR;
     return WIFI_TEST_SetMode(value) ? RESPONSE_OK : RESPONSE_ERROR;
 }
@@ -110,10 +113,9 @@ int pas_wiband_handler(const char *param, int opType, char *response) {
     }
     if (opType != AT_SET_OP) return RESPONSE_ERROR;
 
-    char buf[PARAM_BUF_SIZE];
-    char *cursor;
-    int value;
-    if (!firstInt(param, buf, sizeof(buf), &cursor, &value)) return RESPONSE_INVALID;
+    int value = 0;
+    int rc = onlyParamNumber(param, &value, RESPONSE_ERROR);
+    if (rc != RESPONSE_OK) return rc;
     if (value != 0 && value != 1) return RESPONSE_ERROR;
     if (!WIFI_TEST_SetBandwidth(value)) return RESPONSE_ERROR;
     snprintf(response, RESPONSE_BUF_SIZE, "%s", bandName(value));
@@ -122,7 +124,8 @@ int pas_wiband_handler(const char *param, int opType, char *response) {
 }
 
 // Frequency, data rate and TX power: read back the last accepted value; a
-// refused set reads back as -1.
+// refused set reads back as -1. Every whole number goes to the library, so text
+// that is none is refused like text without digits, before the library sees it.
 typedef bool (*WifiSetter)(int value);
 
 static bool setFrequency(int value) { return WIFI_TEST_SetFrequency(value, 0); }
@@ -136,10 +139,9 @@ static int storedValueHandler(int *stored, WifiSetter setter, const char *param,
     }
     if (opType != AT_SET_OP) return RESPONSE_ERROR;
 
-    char buf[PARAM_BUF_SIZE];
-    char *cursor;
-    int value;
-    if (!firstInt(param, buf, sizeof(buf), &cursor, &value)) return RESPONSE_INVALID;
+    int value = 0;
+    int rc = onlyParamNumber(param, &value, RESPONSE_INVALID);
+    if (rc != RESPONSE_OK) return rc;
     if (!setter(value)) {
         *stored = -1;
         return RESPONSE_ERROR;
@@ -165,10 +167,9 @@ int pas_wipow_handler(const char *param, int opType, char *response) {
 int pas_witx_handler(const char *param, int opType, char *response) {
     (void)response;
     if (opType != AT_SET_OP) return RESPONSE_ERROR;
-    char buf[PARAM_BUF_SIZE];
-    char *cursor;
-    int value;
-    if (!firstInt(param, buf, sizeof(buf), &cursor, &value)) return RESPONSE_INVALID;
+    int value = 0;
+    int rc = onlyParamNumber(param, &value, RESPONSE_INVALID);
+    if (rc != RESPONSE_OK) return rc;
     return WIFI_TEST_SetTX(value != 0) ? RESPONSE_OK : RESPONSE_ERROR;
 }
 
@@ -185,20 +186,26 @@ int pas_wirx_handler(const char *param, int opType, char *response) {
     (void)response;
     if (opType != AT_SET_OP) return RESPONSE_ERROR;
     char buf[PARAM_BUF_SIZE];
-    char *cursor;
-    int value;
-    if (!firstInt(param, buf, sizeof(buf), &cursor, &value)) return RESPONSE_INVALID;
+    char *cursor = copyParam(param, buf, sizeof(buf));
+    int value = 0;
+    int rc = nextParamNumber(&cursor, &value, RESPONSE_ERROR);
+    if (rc != RESPONSE_OK) return rc;
 
     unsigned char first[WIFI_ADDR_LEN];
     unsigned char second[WIFI_ADDR_LEN];
     memset(first, 0, sizeof(first));
     memset(second, 0, sizeof(second));
-    if (value == 0) return WIFI_TEST_SetRX(false, first, second) ? RESPONSE_OK : RESPONSE_ERROR;
+    if (value == 0) {
+        if (at_tok_hasmore(&cursor)) return RESPONSE_ERROR;
+        return WIFI_TEST_SetRX(false, first, second) ? RESPONSE_OK : RESPONSE_ERROR;
+    }
     if (value != 1) return RESPONSE_ERROR;
 
+    // Each address must be a whole 64-bit number; the top two bytes are dropped.
     int64_t a = 0;
     int64_t b = 0;
-    if (at_tok_nextint64(&cursor, &a) < 0 || at_tok_nextint64(&cursor, &b) < 0) return RESPONSE_INVALID;
+    if (at_tok_nextint64_strict(&cursor, &a) != 0 || at_tok_nextint64_strict(&cursor, &b) != 0) return RESPONSE_INVALID;
+    if (at_tok_hasmore(&cursor)) return RESPONSE_ERROR;
     toAddress(a, first);
     toAddress(b, second);
     return WIFI_TEST_SetRX(true, first, second) ? RESPONSE_OK : RESPONSE_ERROR;

@@ -104,37 +104,9 @@ int readDataFromTarget(int target, int *fd) {
     }
 }
 
-int readDataFromTargetWithResult(int target, int *fd, char *buf, int size) {
-    if (fd == NULL || buf == NULL || size < 2) return -1;
-    memset(buf, 0, (size_t)size);
-    // Keep the last byte for the NUL the callers rely on.
-    size_t want = (size_t)(size - 1) < (size_t)MAX_DATA_LEN ? (size_t)(size - 1) : (size_t)MAX_DATA_LEN;
-
-    ssize_t n = receiveFromTarget(*fd, buf, want);
-    if (n < 0) {
-        LOGE("fail to receive data from target socket. errno = %d", errno);
-        closeLink(fd);
-        return -1;
-    }
-    if (n == 0) {
-        LOGD("The peer has performed an orderly shutdown");
-        closeLink(fd);
-        return 0;
-    }
-    LOGD("data receive from %d is %s, data length is %d", target, buf, (int)n);
-    return writeDataToSerial(buf, (int)n);
-}
-
 void serviceReaderLoop(void) {
     if (s_fdService_command == -1) return;
     genericLinkAwaitAnswer(NULL, 0, true);
-}
-
-int serviceReaderLoopWithResult(const char *cmd) {
-    (void)cmd;
-    char buf[DATA_BUF_SIZE];
-    if (genericLinkAwaitAnswer(buf, (int)sizeof(buf), true) < 0) return -1;
-    return strstr(buf, "OK") != NULL ? 1 : -1;
 }
 
 // The descriptor global of an audio target, or NULL for any other target.
@@ -302,5 +274,48 @@ int sendDataToAudio(const char *data, int len, int target) {
     LOGD("sendDataToAudio - the data size of send to audio is: %d", len);
     ssize_t n = send(*fd, data, (size_t)len, MSG_NOSIGNAL);
     if (n < 0 || n < (ssize_t)len) LOGE("lose data when send to audio. errno = %d", errno);
+    return 0;
+}
+
+// The last line of an answer (trailing line ends dropped): its start and length.
+static int lastLine(const char *text, int len, int *lineLen) {
+    int end = len;
+    while (end > 0 && (text[end - 1] == '\r' || text[end - 1] == '\n')) end--;
+    int start = end;
+    while (start > 0 && text[start - 1] != '\r' && text[start - 1] != '\n') start--;
+    *lineLen = end - start;
+    return start;
+}
+
+// A command the daemon puts to the framework on its own behalf (AT^WIENABLE): the
+// answer comes in its place among the answers owed on the link (see
+// genericLinkAwaitAnswer). Its information text is shown to the host, its final
+// result line goes to the caller, so that the host command ends with one final
+// result, its own.
+int exchangeWithGenericService(const char *cmd, char *finalLine, int size) {
+    if (finalLine == NULL || size < 1) return -1;
+    finalLine[0] = '\0';
+    if (s_fdService_command < 0) connectTarget(GENERIC_TYPE);
+    if (s_fdService_command < 0 || sendDataToGenericService(cmd) < 0) return -1;
+
+    char answer[DATA_BUF_SIZE];
+    const int len = genericLinkAwaitAnswer(answer, (int)sizeof(answer), false);
+    if (len <= 0) {
+        LOGE("generic service link ended while answering %s", cmd);
+        return 0;
+    }
+    int lineLen = 0;
+    int lineAt = lastLine(answer, len, &lineLen);
+    if (!endsWithFinalResult(answer, len)) lineAt = len;  // no final line: all of it is text
+    int infoStart = 0, infoEnd = lineAt;
+    while (infoStart < infoEnd && (answer[infoStart] == '\r' || answer[infoStart] == '\n')) infoStart++;
+    while (infoEnd > infoStart && (answer[infoEnd - 1] == '\r' || answer[infoEnd - 1] == '\n')) infoEnd--;
+    if (infoEnd > infoStart) writeDataToSerial(answer + infoStart, infoEnd - infoStart);
+    if (lineAt < len) {
+        if (lineLen >= size) lineLen = size - 1;
+        memcpy(finalLine, answer + lineAt, (size_t)lineLen);
+        finalLine[lineLen] = '\0';
+    }
+    LOGD("generic service answered %s with %s", cmd, finalLine);
     return 0;
 }

@@ -11,11 +11,8 @@ extern bool isATCmdInject;
 // relay every complete answer (modem_link.h, generic_link.h), an audio link its
 // answer (audioReaderLoop).
 int readDataFromTarget(int target, int *fd);
-int readDataFromTargetWithResult(int target, int *fd, char *buf, int size);
 // Waits for the generic service's answer to the command just sent and relays it.
 void serviceReaderLoop(void);
-// The same; 1 when the answer holds "OK", otherwise -1.
-int serviceReaderLoopWithResult(const char *cmd);
 // Waits for an audio link's answer and relays all of it.
 void audioReaderLoop(int target);
 // Sends a command text to the generic service; 0, or -1 when it could not go out
@@ -25,5 +22,10 @@ int sendDataToAudio(const char *data, int len, int target);
 // A target link ended: while a modem command is outstanding the host is told
 // "ERROR:UE is not ready", once. Returns true when it was.
 bool reportUeNotReady(void);
+// Sends cmd to the generic service and relays its answer to the host, all but
+// its final result line, which is stored in finalLine ("OK", "ERROR",
+// "+CME ERROR: 3"; empty when the answer had none or the link ended first).
+// Returns 0, or -1 when there is no link to the service.
+int exchangeWithGenericService(const char *cmd, char *finalLine, int size);
 
 #endif

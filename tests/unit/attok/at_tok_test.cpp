@@ -81,6 +81,42 @@ TEST(AtTok, ParameterWalkUsesUpCursor) {
     }
 }
 
+// The whole-number readers take a number with blanks or quotes around it and
+// nothing else; a refused token stores nothing.
+TEST(AtTok, StrictReadersTakeOnlyWholeNumbersInRange) {
+    const int kWhole = 0, kNotWhole = AT_TOK_NOT_WHOLE;
+    const struct {
+        const char *text;
+        int result;
+        long long value;  // stored by a successful read
+        int result64;
+    } cases[] = {
+        {" \"-12\" ,x", kWhole, -12, kWhole},       {"2147483647", kWhole, INT_MAX, kWhole},
+        {"-2147483648", kWhole, INT_MIN, kWhole},      {"4294967297", kNotWhole, 4294967297LL, kWhole},
+        {"9223372036854775808", kNotWhole, 7, kNotWhole}, {"1abc", kNotWhole, 7, kNotWhole},
+        {"1 2", kNotWhole, 7, kNotWhole},              {"\"3\"x", kNotWhole, 7, kNotWhole},
+        {"\"3", kNotWhole, 7, kNotWhole},              {"abc", AT_TOK_NO_NUMBER, 7, AT_TOK_NO_NUMBER},
+        {"+", AT_TOK_NO_NUMBER, 7, AT_TOK_NO_NUMBER},  {"\" \",1", AT_TOK_EMPTY, 7, AT_TOK_EMPTY},
+    };
+    for (const auto &c : cases) {
+        std::string line = c.text;
+        char *cursor = &line[0];
+        int v = 7;
+        EXPECT_EQ(c.result, at_tok_nextint_strict(&cursor, &v)) << c.text;
+        EXPECT_EQ(c.result == kWhole ? c.value : 7, v) << c.text;
+        line = c.text;
+        cursor = &line[0];
+        int64_t v64 = 7;
+        EXPECT_EQ(c.result64, at_tok_nextint64_strict(&cursor, &v64)) << c.text;
+        EXPECT_EQ(c.result64 == kWhole ? c.value : 7, v64) << c.text;
+    }
+    std::string used = "5";
+    char *cursor = &used[0];
+    int v = 0;
+    ASSERT_EQ(kWhole, at_tok_nextint_strict(&cursor, &v));
+    EXPECT_EQ(AT_TOK_EMPTY, at_tok_nextint_strict(&cursor, &v)) << "a used-up cursor";
+}
+
 TEST(AtNormalize, UpperCaseAndTrim) {
     std::string a = "at+cmgs=\"abc\"";
     convertToUpperCase(&a[0], '=');

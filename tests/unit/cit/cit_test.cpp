@@ -2,9 +2,11 @@
 // record, the result file) and those passed to the test application, against an
 // in-test application on the abstract socket the daemon connects to.
 #include <signal.h>
+#include <sys/resource.h>
 #include <sys/wait.h>
 
 #include <algorithm>
+#include <filesystem>
 #include <fstream>
 #include <memory>
 
@@ -92,20 +94,6 @@ std::string framedVerdict(const std::string &text, bool ok) {
 
 }  // namespace
 
-// Nothing may be read or written outside the 1024-byte record. (Index 1024 and a
-// read without "=": cit.tx.)
-TEST_F(CitLocal, ProInfoRefusesIndexesOutsideTheRecord) {
-    const std::string before(PRODUCT_INFO_SIZE, '\0');
-    root.write(kStore, before);
-    for (const char *line : {"AT*CIT_READPROINFO=-1", "AT*CIT_READPROINFO=99999999999999999999",
-                             "AT*CIT_WRITEPROINFO=-5,1", "AT*CIT_WRITEPROINFO=4294967296,1"}) {
-        EXPECT_EQ("\r\nERROR\r\n", ask(line)) << line;
-    }
-    // Without both "=" and "," a write gets no answer at all.
-    EXPECT_EQ("", ask("AT*CIT_WRITEPROINFO 5,6"));
-    EXPECT_EQ(before, root.read(kStore));
-}
-
 // The station records a pass for every OK: a flag that did not reach the store is
 // an error, a stored one is answered as always. (AT*CIT_WriteProInfo both ways,
 // and AT*CIT_WriteUserAT on a record of the wrong shape: cit.tx.)
@@ -114,16 +102,39 @@ TEST_F(CitLocal, FlagWritesAnswerOkOnlyWhenStored) {
     root.write(kStore, std::string(PRODUCT_INFO_SIZE, '\x01'));
     EXPECT_EQ("\r\nWriteUserAT Pass\r\nOK\r\n", ask("AT*CIT_WRITEUSERAT"));
     EXPECT_EQ(0, getFlag(FLAG_USER_AT));
+    // Blanks and quotes around a number are taken as the tokenizer takes them.
+    EXPECT_EQ("\r\nOK\r\n", ask("AT*CIT_WRITEPROINFO= 7 ,\"200\""));
+    EXPECT_EQ(200, getFlag(7));
+    // A run whose mark the property store did not take has not started.
+    std::filesystem::remove_all(root.at("/properties"));
+    root.write("/properties", "not a folder");
+    EXPECT_EQ("\r\nERROR\r\n", ask("AT*CIT_START"));
 }
 
-// A file too short to hold character 7 is written whole, never padded with NULs:
-// rootfaults.tx.
+// A file too short to hold character 7 is written whole, never padded with NULs,
+// and one that can be neither opened nor created answers ERROR: root_faults.tx.
 TEST_F(CitLocal, ResultFileEdges) {
-    EXPECT_EQ("\r\nERROR\r\n", ask("AT*CIT_WCITF")) << "no folder: neither opened nor created";
-    // An existing file keeps its other characters; only character 7 changes.
-    root.write(CIT_RESULT_FILE, "y1234560tail");
-    ask("AT*CIT_WCITF");
-    EXPECT_EQ("y1234561tail", root.read(CIT_RESULT_FILE));
+    // An existing file keeps its other characters; only character 7 changes, and
+    // a file of 7 characters has room for it; a shorter one is written whole.
+    // Nothing is left open.
+    const size_t fds = std::distance(std::filesystem::directory_iterator("/proc/self/fd"), {});
+    const std::pair<const char *, const char *> files[] = {
+        {"y1234560tail", "y1234561tail"}, {"y123456", "y1234561"}, {"abcdef", "x0000001"}};
+    for (const auto &f : files) {
+        root.write(CIT_RESULT_FILE, f.first);
+        EXPECT_EQ("\r\nOK\r\n", ask("AT*CIT_WCITF"));
+        EXPECT_EQ(f.second, root.read(CIT_RESULT_FILE));
+    }
+    EXPECT_EQ(fds, std::distance(std::filesystem::directory_iterator("/proc/self/fd"), {}));
+    // A disk that takes nothing more (a file size limit of 0): no result is stored.
+    signal(SIGXFSZ, SIG_IGN);
+    struct rlimit old, none;
+    ASSERT_EQ(0, getrlimit(RLIMIT_FSIZE, &old));
+    none = {0, old.rlim_max};
+    ASSERT_EQ(0, setrlimit(RLIMIT_FSIZE, &none));
+    const std::string full = ask("AT*CIT_CCITF");
+    ASSERT_EQ(0, setrlimit(RLIMIT_FSIZE, &old));
+    EXPECT_EQ("\r\nERROR\r\n", full);
     // At most 32 characters of the first line are shown.
     root.write(CIT_RESULT_FILE, std::string(40, '7'));
     EXPECT_EQ("\r\n" + std::string(32, '7') + "\r\nOK\r\n", ask("AT*CIT_GACITF"));
@@ -164,11 +175,11 @@ TEST_F(CitForward, KeptLinkToARestartedApplicationIsNotReused) {
 }
 
 // Two records. (No store, and one record of the wrong size: cit.tx.)
-TEST(ProInfo, UnusableStoreGivesFallbacksAndIsNeverWritten) {
+TEST(ProInfo, UnusableStoreGivesNoFlagAndIsNeverWritten) {
     TestRoot root;
     const std::string twoRecords(2 * PRODUCT_INFO_SIZE, '\x01');
     root.write(kStore, twoRecords);
-    EXPECT_EQ(255, getFlag(FLAG_MMI1_RESULT));
+    EXPECT_EQ(-1, getFlag(FLAG_MMI1_RESULT));
     EXPECT_EQ(-1, setFlag(FLAG_MMI1_RESULT, 0));
     EXPECT_EQ(twoRecords, root.read(kStore));
 }
@@ -178,7 +189,7 @@ TEST(ProInfo, IndexesOutsideTheRecordAreRefused) {
     const std::string r(PRODUCT_INFO_SIZE, '\x11');
     root.write(kStore, r);
     for (int index : {-1, PRODUCT_INFO_SIZE, PRODUCT_INFO_SIZE + 1, -2147483647 - 1, 2147483647}) {
-        EXPECT_EQ(255, getFlag(index)) << index;
+        EXPECT_EQ(-1, getFlag(index)) << index;
         setFlag(index, 0x22);
     }
     EXPECT_EQ(r, root.read(kStore));

@@ -4,6 +4,7 @@
 #include <cstdlib>
 #include <ctime>
 #include <filesystem>
+#include <thread>
 
 #include "../dispatch/handler_state.h"
 #include "attok/at_tok.h"
@@ -34,28 +35,38 @@ TEST_F(ClockCmdTest, SetTakesTheFieldsAsUtcAndLeavesTzAlone) {
     EXPECT_LE(secondsFrom(k20240229Noon), 2);
     EXPECT_EQ(32, gCclkTz);
     EXPECT_EQ(tz + 3, std::getenv("TZ")) << "the caller's TZ entry itself, not a copy";
-
     unsetenv("TZ");
     tzset();
-    // Hour 24, minute 60 and second 60 pass the check and roll over; hour 0 is a time.
-    EXPECT_EQ(0, cclk("24/02/29, 24:60:60"));
-    EXPECT_LE(secondsFrom(1709254860), 2);
+    EXPECT_EQ(0, cclk("24/02/29, 12:00:00"));
     EXPECT_EQ(nullptr, std::getenv("TZ")) << "an unset TZ stays unset";
     EXPECT_EQ(32, gCclkTz) << "17 characters leave the stored zone";
     EXPECT_STREQ("", response);
-    EXPECT_EQ(0, cclk("24/03/01,00:00:00"));
-    EXPECT_LE(secondsFrom(k20240229Noon + 12 * 3600), 2);
 }
 
-TEST_F(ClockCmdTest, SetRefusesBadFieldsZonesAndCutsAnOverlongValue) {
-    time_t before = time(nullptr);
-    // Month 13 and a refused date with a good zone: local_commands.tx.
-    for (const char *bad : {"24/00/01,00:00:00", "24/01/32,00:00:00", "24/01/01,25:00:00", "24/01/01,00:61:00",
-                            "ab/01/01,00:00:00", "24/02/29,12:00:00+99"}) {
+// Every day a calendar has, the zone limits, a leap second and the end of a day;
+// nothing that would roll over into another date. (Hour 00, month 13 and the
+// CME ERROR of a wrong length: local_commands.tx.)
+TEST_F(ClockCmdTest, SetTakesRealDatesOnlyAndARefusalChangesNothing) {
+    const std::pair<const char *, time_t> good[] = {
+        {"24/01/31,00:00:00+96", 1706659200}, {"23/12/31,23:59:60-96", 1704067200},
+        {"24/02/29,24:00:00", 1709251200},    {"00/02/29,00:00:00", 951782400},
+        {"99/04/01,00:00:00", 4078684800},
+    };
+    for (const auto &g : good) {
+        EXPECT_EQ(0, cclk(g.first)) << g.first;
+        EXPECT_LE(secondsFrom(g.second), 2) << g.first;
+    }
+    EXPECT_EQ(-96, gCclkTz);
+    const time_t before = time(nullptr);
+    for (const char *bad : {"23/02/29,00:00:00", "24/02/30,12:00:00", "24/04/31,23:59:60+32", "24/00/01,00:00:00",
+                            "24/01/32,00:00:00", "24/01/00,00:00:00", "24/01/01,12:60:00", "24/01/01,24:00:01",
+                            "24/01/01,25:00:00", "24/02/29;12:34:56", "24/02/29,12:34.56", "2b/01/01,00:00:00",
+                            "-1/01/01,00:00:00", "24/01/01,00:00:00+97", "24/01/01,00:00:00-97",
+                            "24/01/01,00:00:00+3x", "24/01/01,00:00:00032", "24/01/01,00:00:61+04"}) {
         EXPECT_EQ(4, cclk(bad)) << bad;
         EXPECT_STREQ("", response) << bad;
     }
-    EXPECT_EQ(65535, gCclkTz) << "a zone out of range is not stored";
+    EXPECT_EQ(-96, gCclkTz) << "a refused command stores no zone";
     EXPECT_LE(secondsFrom(before), 2) << "no refused value moved the clock";
     // The working copy stops at 39 characters, the answer at the buffer's end.
     std::string huge(5000, '1');
@@ -81,31 +92,29 @@ TEST_F(HandlerTest, SimSelectionFollowsTheSimCountAndC2kMode) {
     EXPECT_EQ("2", prop("persist.service.tolk.sim"));
     // Any number but 0 is C2K mode; 2^32 must not wrap to 0.
     ASSERT_EQ(0, property_set("ro.boot.opt_c2k_lte_mode", "4294967296"));
-    EXPECT_EQ(0, esuo("9", AT_SET_OP));
-    EXPECT_EQ("9", prop("persist.service.tolk.sim"));
+    for (const char *sim : {"5", "4", "9"}) {
+        EXPECT_EQ(0, esuo(sim, AT_SET_OP));
+        EXPECT_EQ(std::to_string(*sim == '9' ? 9 : *sim - '4'), prop("persist.service.tolk.sim")) << sim;
+    }
     EXPECT_EQ(4, esuo("6", AT_SET_OP)) << "no SIM 3 in C2K mode, even on a triple-SIM device";
     EXPECT_EQ("9", prop("persist.service.tolk.sim"));
     EXPECT_EQ(0, esuo("", AT_TEST_OP)) << "the test answer does not look at C2K mode";
     EXPECT_EQ("\r\n+ESUO: (4-6)\r\n", host.take());
 }
 
-// Echo takes only the digits 0 and 1; a switch takes a quoted value too. (AT%EURC
-// shares the switch handler, and a stored number out of range: local_commands.tx.)
-TEST_F(HandlerTest, EchoAndPropertySwitchesTakeOnlyTheirValues) {
+// Echo takes only the digits 0 and 1. (Quoted numbers: AtTok.)
+TEST_F(HandlerTest, EchoTakesOnlyItsValues) {
     gSerialDevice.echoOption[DEVICE_SERIAL] = 1;
     EXPECT_EQ(4, call(pas_echo_handler, "ATE2", AT_BASIC_OP));
     EXPECT_EQ(1, gSerialDevice.echoOption[DEVICE_SERIAL]);
     EXPECT_EQ(0, call(pas_echo_handler, "ate0", AT_BASIC_OP));
     EXPECT_EQ(0, gSerialDevice.echoOption[DEVICE_SERIAL]);
-    EXPECT_EQ(0, call(pas_tolk_handler, "1", AT_SET_OP));
-    EXPECT_EQ(0, call(pas_tolk_handler, "\"0\"", AT_SET_OP));
-    EXPECT_EQ("0", prop("persist.service.tolk.usermode"));
 }
 
 // AT@USBCONFIG: at most the first 91 characters count, and quotes dropped from
-// them are not made up for by later ones; a store that cannot take the value
-// gives ERROR with the value echoed.
-TEST_F(HandlerTest, UsbConfigCutAndRefusedByTheStore) {
+// them are not made up for by later ones. A store that cannot take a value gives
+// ERROR (AT@USBCONFIG with the value echoed): the setting did not change.
+TEST_F(HandlerTest, UsbConfigCutAndPropertyWritesRefusedByTheStore) {
     const std::string param(89, 'a');
     EXPECT_EQ(0, call(pas_usbconfig_handler, ("'" + param + "'XYZ").c_str(), AT_SET_OP));
     EXPECT_EQ(param, prop("sys.usb.config"));
@@ -113,6 +122,27 @@ TEST_F(HandlerTest, UsbConfigCutAndRefusedByTheStore) {
     root.write("/properties", "not a folder");
     EXPECT_EQ(4, call(pas_usbconfig_handler, "adb", AT_SET_OP));
     EXPECT_STREQ("\r\n@USBCONFIG=\"adb\"\r\n\r\nERROR\r\n", response);
+    for (CmdHandler h : {pas_tolk_handler, pas_eurc_handler, pas_usbTethering_handler, pas_esuo_handler}) {
+        EXPECT_EQ(4, call(h, h == pas_esuo_handler ? "4" : "1", AT_SET_OP));
+        EXPECT_EQ(4, call(h, h == pas_esuo_handler ? "5" : "0", AT_SET_OP));
+    }
+}
+
+// What waited on the framework's link before the command is an earlier answer and
+// goes to the host first; what came behind the final result line goes after the
+// answer's own text. (The answers themselves: wifi_test.tx.)
+TEST_F(HandlerTest, WifiFrameworkExchangeRelaysWhatIsNotItsAnswerInOrder) {
+    int service = socketLink(&s_fdService_command);
+    writeAll(service, "\r\n+EARLIER: 1\r\n\r\nERROR\r\n");
+    std::thread framework([service] {
+        EXPECT_EQ("AT+WITOF=2", drainFd(service, 3000, 0));
+        writeAll(service, "\r\n+WITOF: 1\r\n\r\nOK\r\n\r\n+LATER\r\n");
+    });
+    EXPECT_EQ(0, call(pas_wienable_handler, "1", AT_SET_OP));
+    framework.join();
+    EXPECT_EQ("\r\n+EARLIER: 1\r\n\r\nERROR\r\n\r\n+WITOF: 1\r\n\r\n+LATER\r\n", host.take());
+    closeFd(s_fdService_command);
+    closeFd(service);
 }
 
 }  // namespace
