@@ -177,6 +177,10 @@ void genericLinkDrain(void) {
 
 namespace {
 
+// How long the waiting command's own answer may pause before what came is taken
+// as all of it (an answer without a final result line).
+#define OWN_ANSWER_WAIT_MS 500
+
 // Hands the first len bytes of rx to the waiting command: copied into buf, relayed
 // to its link when relay is set, and taken from rx.
 int takeOwnAnswer(const HostLink *to, int len, char *buf, int size, bool relay) {
@@ -220,8 +224,11 @@ int genericLinkAwaitAnswer(char *buf, int size, bool relay) {
             rxLen = 0;
         }
 
+        // The waiting command is judged by its final result line, so the service
+        // gets longer to finish its answer than the piece wait of the others.
+        const int quietMs = rxLen == 0 ? -1 : ahead == 0 ? OWN_ANSWER_WAIT_MS : ANSWER_PIECE_WAIT_MS;
         struct pollfd p = {s_fdService_command, POLLIN, 0};
-        int rc = poll(&p, 1, rxLen > 0 ? ANSWER_PIECE_WAIT_MS : -1);
+        int rc = poll(&p, 1, quietMs);
         if (rc < 0 && errno == EINTR) continue;
         if (rc < 0) {
             LOGE("Fail to select in serviceReaderLoop. error: %d", errno);
