@@ -32,6 +32,16 @@ namespace {
 
 int removeEntry(const char *path, const struct stat *, int, struct FTW *) { return remove(path); }
 
+// In a child: becomes tolk-sim with args.
+[[noreturn]] void execSim(const std::vector<std::string> &args) {
+    std::vector<char *> argv;
+    argv.push_back(const_cast<char *>(TOLK_SIM_BINARY));
+    for (const auto &a : args) argv.push_back(const_cast<char *>(a.c_str()));
+    argv.push_back(nullptr);
+    execv(TOLK_SIM_BINARY, argv.data());
+    _exit(127);
+}
+
 }  // namespace
 
 int runSim(const std::vector<std::string> &args, std::string *out, bool errToo) {
@@ -42,12 +52,7 @@ int runSim(const std::vector<std::string> &args, std::string *out, bool errToo) 
     if (pid == 0) {
         dup2(pfd[1], 1);
         if (errToo) dup2(pfd[1], 2);
-        std::vector<char *> argv;
-        argv.push_back(const_cast<char *>(TOLK_SIM_BINARY));
-        for (const auto &a : args) argv.push_back(const_cast<char *>(a.c_str()));
-        argv.push_back(nullptr);
-        execv(TOLK_SIM_BINARY, argv.data());
-        _exit(127);
+        execSim(args);
     }
     close(pfd[1]);
     std::string collected;
@@ -72,12 +77,7 @@ pid_t startSim(const std::vector<std::string> &args, int in, int out) {
     if (pid == 0) {
         dup2(in, 0);
         dup2(out, 1);
-        std::vector<char *> argv;
-        argv.push_back(const_cast<char *>(TOLK_SIM_BINARY));
-        for (const auto &a : args) argv.push_back(const_cast<char *>(a.c_str()));
-        argv.push_back(nullptr);
-        execv(TOLK_SIM_BINARY, argv.data());
-        _exit(127);
+        execSim(args);
     }
     return pid;
 }
