@@ -22,6 +22,10 @@ namespace {
 
 // The console's piped mode: how long a line without a complete answer waits.
 const int kPipedSilenceMs = 300;
+// A raw answer (audio, device-maker test frames) has no end mark: the daemon
+// passes its pieces on as they come and waits briefly for the next, so the
+// quiet that ends it must be well above that wait.
+const int kRawAnswerQuietMs = 300;
 
 bool isFinalLine(const std::string &l, bool numeric) {
     static const char *const finals[] = {
@@ -189,6 +193,7 @@ int cmdAt(const AtOptions &opt) {
         }
         std::string received;
         bool complete = false;
+        int quietMs = opt.quietMs;
         long long lastByte = nowMs();
         for (;;) {
             if (interrupted()) {
@@ -196,7 +201,7 @@ int cmdAt(const AtOptions &opt) {
                 return kExitFailed;
             }
             long long now = nowMs();
-            if (complete && now - lastByte >= opt.quietMs) break;  // the answer and its tail are in
+            if (complete && now - lastByte >= quietMs) break;  // the answer and its tail are in
             if (!complete && opt.silenceEnds && now - lastByte >= opt.quietMs) break;
             if (now >= deadline) {
                 if (complete) break;  // a link that never goes quiet: the answer is in all the same
@@ -210,7 +215,7 @@ int cmdAt(const AtOptions &opt) {
                 return kExitNoAnswer;
             }
             long long wait = deadline - now;
-            if (complete || opt.silenceEnds) wait = std::min<long long>(wait, lastByte + opt.quietMs - now);
+            if (complete || opt.silenceEnds) wait = std::min<long long>(wait, lastByte + quietMs - now);
             struct pollfd pf[2] = {{fd, POLLIN, 0}, {gInterruptFd, POLLIN, 0}};
             int r = poll(pf, gInterruptFd >= 0 ? 2 : 1, static_cast<int>(std::max<long long>(wait, 0)));
             if (r < 0 && errno == EINTR) continue;
@@ -227,7 +232,10 @@ int cmdAt(const AtOptions &opt) {
             fflush(stdout);
             received.append(buf, static_cast<size_t>(n));
             lastByte = nowMs();
-            if (!complete) complete = isCompleteAnswer(line, received, numeric);
+            if (!complete) {
+                complete = isCompleteAnswer(line, received, numeric);
+                if (complete && !hasFinalResult(received, numeric)) quietMs = std::max(quietMs, kRawAnswerQuietMs);
+            }
         }
     }
     close(fd);
