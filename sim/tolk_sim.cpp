@@ -54,7 +54,7 @@ const char kUsage[] =
     "                            once tolkd is serving. Options:\n"
     "      --prop NAME=VALUE       preset a system property (repeatable)\n"
     "      --boot-mode TEXT        content of the boot mode file (default \"0\";\n"
-    "                              \"5\" is the engineering mode: tolkd exits)\n"
+    "                              \"5\" is the engineering mode: tolkd idles)\n"
     "      --no-boot-mode          no boot mode file at all\n"
     "      --no-control-socket     no adb control socket\n"
     "      --log-tags TAGS         ANDROID_LOG_TAGS for tolkd (default \"*:i\";\n"

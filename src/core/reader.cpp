@@ -58,10 +58,13 @@ static char adbBuf[DATA_BUF_SIZE];
 // cycles until they are taken or their connection goes away.
 static char adbLine[DATA_BUF_SIZE];
 static int adbLineLen = 0;
+// The last adb line ended at CR: an LF right behind it is the rest of a CR LF.
+static bool adbLineEndedAtCr = false;
 
 void discardAdbLine(void) {
     memset(adbLine, 0, sizeof(adbLine));
     adbLineLen = 0;
+    adbLineEndedAtCr = false;
 }
 
 // select() can only watch descriptors below FD_SETSIZE; anything else is unusable.
@@ -193,16 +196,27 @@ static int adbLineEnd(void) {
 
 // Moves the first complete adb line to lineBuf; the bytes behind it stay for the
 // next lines. Returns its length, or 0 when no line is complete yet.
+static void dropAdbBytes(int len) {
+    const int rest = adbLineLen - len;
+    memmove(adbLine, adbLine + len, (size_t)rest);
+    memset(adbLine + rest, 0, (size_t)len);
+    adbLineLen = rest;
+}
+
 static int takeAdbLine(void) {
+    // A station that ends its lines with CR LF: the LF belongs to the line before,
+    // also when it comes in the next read, and must not head the next command.
+    if (adbLineEndedAtCr && adbLineLen > 0) {
+        adbLineEndedAtCr = false;
+        if (adbLine[0] == '\n') dropAdbBytes(1);
+    }
     const int len = adbLineEnd();
     if (len == 0) return 0;
     LOGD(".AT command read done.");
     memcpy(lineBuf, adbLine, (size_t)len);
     lineBuf[len] = '\0';
-    const int rest = adbLineLen - len;
-    memmove(adbLine, adbLine + len, (size_t)rest);
-    memset(adbLine + rest, 0, (size_t)len);
-    adbLineLen = rest;
+    dropAdbBytes(len);
+    adbLineEndedAtCr = lineBuf[len - 1] == '\r';
     return len;
 }
 
@@ -341,10 +355,14 @@ char *readline(SerialDevice *dev) {
         LOGD("Wait for select data from USB");
         struct timeval tv;
         const int ready = select(maxFd + 1, &readSet, NULL, NULL, selectTimeout(&tv));
-        if (ready == 0) {
-            genericLinkQuiet();
-            msgTextPhaseEndedBy(modemLinkQuiet());
-            continue;
+        if (ready >= 0) {
+            // An answer whose link has been quiet for the piece wait is complete,
+            // whatever else woke the loop; a link with bytes waiting is read first.
+            if (genericLinkQuietMs() == 0 && !(ready > 0 && isReady(s_fdService_command, &readSet))) genericLinkQuiet();
+            if (modemLinkQuietMs() == 0 && !(ready > 0 && isReady(s_fdRild_command, &readSet))) {
+                msgTextPhaseEndedBy(modemLinkQuiet());
+            }
+            if (ready == 0) continue;
         }
         if (ready < 0) {
             if (errno == EINTR || errno == EAGAIN) continue;

@@ -73,14 +73,27 @@ int finalResultEnd(const char *data, int len) {
     return 0;
 }
 
-bool endsWithFinalResult(const char *data, int len) {
-    if (data == NULL || len <= 0) return false;
+// The last line of data (its text up to a NUL, trailing line ends dropped).
+static const char *lastLineOf(const char *data, int len, int *n) {
     int end = (int)strnlen(data, (size_t)len);
     while (end > 0 && (data[end - 1] == '\r' || data[end - 1] == '\n')) end--;
     int start = end;
     while (start > 0 && data[start - 1] != '\r' && data[start - 1] != '\n') start--;
-    const char *line = data + start;
-    const int n = end - start;
+    *n = end - start;
+    return data + start;
+}
+
+bool endsWithResultCode(const char *data, int len) {
+    if (data == NULL || len <= 0) return false;
+    int n = 0;
+    const char *line = lastLineOf(data, len, &n);
+    return isFinalResultLine(line, n);
+}
+
+bool endsWithFinalResult(const char *data, int len) {
+    if (data == NULL || len <= 0) return false;
+    int n = 0;
+    const char *line = lastLineOf(data, len, &n);
     if (isFinalResultLine(line, n)) return true;
     for (const char *prefix : kSmsResultPrefixes) {
         if (lineStartsWith(line, n, prefix)) return true;

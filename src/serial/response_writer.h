@@ -50,9 +50,13 @@ void Response2Numeric(const char *in, char *out);
 // and including the CR LF that ends its final result line (OK, ERROR, +CME ERROR:,
 // +CMS ERROR:, or another V.250 final result code); 0 when none has come yet.
 int finalResultEnd(const char *data, int len);
-// True when the last line of an answer is a final result line, one that ends at
-// the end of data included; an SMS command's own result (+CMGS: and the like)
-// counts as well. Such an answer ends the text phase of an SMS command.
+// True when the last line of data is a final result line (OK, ERROR, +CME ERROR:,
+// +CMS ERROR:, another V.250 final result code), one that ends at the end of data
+// included: such a line ends an answer.
+bool endsWithResultCode(const char *data, int len);
+// The same, or an SMS command's own result (+CMGS: and the like), which the modem
+// may send without a final result line of its own: such an answer ends the text
+// phase of an SMS command.
 bool endsWithFinalResult(const char *data, int len);
 
 // Writes device-maker audio answers byte for byte, waiting, retrying and reopening.

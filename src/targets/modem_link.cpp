@@ -7,10 +7,10 @@
 // than one buffer is relayed in pieces, framed once as a whole.
 //
 // An answer is normally one callback. A modem that hands its answer over in
-// several (a real AT channel delivers what it has) is put together: an answer is
-// complete at its final result line or its SMS prompt, or when its slot has said
-// nothing more for the piece wait, so that its pieces go to one link and count
-// once.
+// several (a real AT channel delivers what it has) keeps them together: an answer
+// is complete at its final result line or its SMS prompt, or when its slot has
+// said nothing more for the piece wait, so that its callbacks go to one link and
+// count once. Each callback is framed on its own, as it always was.
 #include "targets/modem_link.h"
 
 #include <errno.h>
@@ -91,9 +91,10 @@ void keepTail(SlotAnswer *a, const char *data, int len) {
 }
 
 // An answer is complete at its final result line, or at the prompt of an SMS
-// command waiting for its text.
+// command waiting for its text. (An SMS command's own result line, +CMGS: and the
+// like, is followed by its OK: the OK ends the answer, or the slot's quiet does.)
 bool answerComplete(const SlotAnswer *a) {
-    if (endsWithFinalResult(a->tail, a->tailLen)) return true;
+    if (endsWithResultCode(a->tail, a->tailLen)) return true;
     return a->tailLen >= 2 && a->tail[a->tailLen - 2] == '>' && a->tail[a->tailLen - 1] == ' ';
 }
 
@@ -116,7 +117,8 @@ void openAnswer(int slot) {
     mmiTextLen = 0;
 }
 
-// Relays a piece of slot's answer (text only, no NUL); last: the answer ends with it.
+// Relays a piece of a record of slot's answer (text only, no NUL); last: the record
+// ends with it.
 void answerPiece(int slot, const char *data, int len, bool last) {
     SlotAnswer *a = &answers[slot];
     keepTail(a, data, len);
@@ -128,7 +130,7 @@ void answerPiece(int slot, const char *data, int len, bool last) {
     }
     LOGD("data receive from %d is %.*s", RIL_TYPE, len, data);
     LOGD("data receive data length is %d", len);
-    // An answer without any text (empty HAL data) has nothing to show.
+    // A record without any text (empty HAL data) has nothing to show.
     if (last && len == 0 && !a->pieces.started && a->pieces.heldLen == 0) return;
     writeAnswerPiece(&a->to, &a->pieces, data, len, last);
 }
@@ -153,7 +155,6 @@ unsigned closeAnswer(int slot) {
 unsigned forgetSlot(int slot) {
     unsigned phase = 0;
     if (answers[slot].open) {
-        answerPiece(slot, "", 0, true);
         phase = answers[slot].textPhase;
         closeAnswer(slot);
     }
@@ -177,6 +178,7 @@ void beginRecord(void) {
         if (!answers[slot].open) openAnswer(slot);
         // While a record of it is being read the answer is not quiet.
         answers[slot].quietAt = -1;
+        answerPiecesReset(&answers[slot].pieces);  // each record is framed on its own
         return;
     }
     answerPiecesReset(&rx.pieces);
@@ -202,7 +204,7 @@ unsigned relayRecordData(bool last) {
             SlotAnswer probe = *a;
             keepTail(&probe, rx.text, text);
             const bool complete = answerComplete(&probe);
-            answerPiece(slot, rx.text, text, complete);
+            answerPiece(slot, rx.text, text, true);
             rx.textLen = 0;
             if (complete) return closeAnswer(slot);
             a->quietAt = nowMs() + ANSWER_PIECE_WAIT_MS;
@@ -331,7 +333,6 @@ unsigned modemLinkQuiet(void) {
         SlotAnswer *a = &answers[slot];
         if (!a->open || a->quietAt < 0 || a->quietAt > now) continue;
         // The slot said no more: what came is the whole answer.
-        answerPiece(slot, "", 0, true);
         unsigned phase = closeAnswer(slot);
         if (phase > ended) ended = phase;
     }
