@@ -6,8 +6,12 @@ set -u
 top=${1:-$(cd "$(dirname "$0")/../.." && pwd)}
 tree=$(mktemp -d /tmp/tolk-make.XXXXXX)
 trap 'rm -rf "$tree"' EXIT
-# Not the jobserver of a make that runs this test.
-mk() { env -u MAKEFLAGS -u MAKELEVEL -u MFLAGS make -s -C "$top" configure BUILD="$tree/b" "$@" >>"$tree/out" 2>&1; }
+# Not the jobserver of a make that runs this test, nor the settings it exports
+# (make asan runs the suite with BUILD_TYPE=Debug and its own CMAKE_FLAGS).
+mk() {
+    env -u MAKEFLAGS -u MAKELEVEL -u MFLAGS -u BUILD -u BUILD_TYPE -u CMAKE_FLAGS -u JOBS -u TEST_JOBS \
+        make -s -C "$top" configure BUILD="$tree/b" "$@" >>"$tree/out" 2>&1
+}
 type_is() { grep -qx "CMAKE_BUILD_TYPE:STRING=$1" "$tree/b/CMakeCache.txt" 2>/dev/null; }
 mk CMAKE_FLAGS=-DCMAKE_CXX_COMPILER=/nonexistent/c++ && { echo "FAILED: a missing compiler configured"; exit 1; }
 mk && [ -f "$tree/b/Makefile" ] && type_is RelWithDebInfo || { echo "FAILED: no recovery from a failed configure"; cat "$tree/out"; exit 1; }
