@@ -53,7 +53,7 @@ asan:
 	$(MAKE) test soak BUILD=build-asan BUILD_TYPE=Debug TEST_JOBS=$(JOBS) CMAKE_FLAGS="-DTOLKD_SANITIZE=ON -DTOLKD_BUILD_BENCH=OFF"
 
 # tolkd cross-built for 64-bit Arm and run under qemu-user inside the x86-64
-# simulated device (build-arm64/, build-arm64-host/; docs/ARM64.md).
+# simulated device (build-arm64/, and build/ for the x86-64 side; docs/ARM64.md).
 test-arm64:
 	tools/test-arm64.sh
 

@@ -3,7 +3,9 @@
 #
 #   build-arm64/       tolkd, the unit tests and the platform tests, cross-built with
 #                      Debian's aarch64 toolchain (static), plus GoogleTest for aarch64
-#   build-arm64-host/  the x86-64 tolk-sim, its peers and the end-to-end tests
+#   build/             the x86-64 tolk-sim, its peers and the end-to-end tests: the
+#                      tree make test builds (configured the same way), so CI builds
+#                      them once
 #
 # The unit and platform tests run under qemu-aarch64; then the end-to-end suite
 # (label e2e, transcripts included) runs against the arm64 daemon, started by the
@@ -12,7 +14,7 @@ set -euo pipefail
 cd "$(dirname "$0")/.."
 src=$(pwd)
 cross=${ARM64_BUILD:-build-arm64}
-host=${ARM64_HOST_BUILD:-build-arm64-host}
+host=${ARM64_HOST_BUILD:-build}
 jobs=${JOBS:-2}
 toolchain=$src/cmake/aarch64-linux-gnu.cmake
 started=$(date +%s)
