@@ -181,10 +181,10 @@ namespace {
 // as all of it (an answer without a final result line).
 #define OWN_ANSWER_WAIT_MS 500
 
-// Hands the first len bytes of rx to the waiting command: copied into buf, relayed
-// to its link when relay is set, and taken from rx.
+// Hands the first len bytes of rx to the waiting command: copied into buf (when
+// given; size at least 1), relayed to its link when relay is set, and taken from rx.
 int takeOwnAnswer(const HostLink *to, int len, char *buf, int size, bool relay) {
-    if (buf != NULL && size > 0) {
+    if (buf != NULL) {
         int copy = len < size - 1 ? len : size - 1;
         memcpy(buf, rx, (size_t)copy);
         buf[copy] = '\0';
@@ -199,7 +199,7 @@ int takeOwnAnswer(const HostLink *to, int len, char *buf, int size, bool relay) 
 }  // namespace
 
 int genericLinkAwaitAnswer(char *buf, int size, bool relay) {
-    if (buf != NULL && size > 0) buf[0] = '\0';
+    if (buf != NULL) buf[0] = '\0';
     if (s_fdService_command < 0) return -1;
     // The service answers in the order the commands went out: the answers still
     // owed to earlier commands come first and go to their own links; this

@@ -26,8 +26,8 @@ void genericLinkDrain(void);
 // the answers still owed to earlier commands come first and go to their links;
 // the one after them, complete at its final result line or when the link goes
 // quiet, is this one. It is relayed to the current link when relay is set and
-// copied into buf (size bytes, NUL-terminated). Returns its length, or -1 when
-// none came (the link failed or ended first).
+// copied into buf (size bytes, at least 1, NUL-terminated; buf may be NULL). Returns its
+// length, or -1 when none came (the link failed or ended first).
 int genericLinkAwaitAnswer(char *buf, int size, bool relay);
 // The link was closed: what is pending goes out, the answers due are forgotten.
 void genericLinkClosed(void);

@@ -173,15 +173,17 @@ TEST_F(TargetLinks, SynchronousExchangeJudgesOnlyItsOwnAnswer) {
     EXPECT_EQ("", host.drain(100)) << "kept from the host when the caller judges it";
 
     // An answer still owed to an earlier command comes first and goes to its own
-    // link, even when it arrives after the waiting command went out; one cut in
-    // two is put together.
+    // link, even when it arrives after the waiting command went out, and longer
+    // than a buffer; the waiting command's own, cut in two, is put together.
+    const std::string listing = "\r\n+CMGL: " + std::string(6500, 'L') + "\r\n\r\nOK\r\n";
     genericCommandSent(&viaAdb);
     ASSERT_EQ(0, sendDataToGenericService("AT+POWERKEY"));
-    writeAll(service, "\r\n+SN: TS2\r\n\r\nOK\r\n");
+    for (size_t at : {size_t(0), size_t(4000), size_t(MAX_DATA_LEN)})  // as a buffer takes it
+        writeAll(service, listing.substr(at, at == 0 ? 4000 : at == 4000 ? MAX_DATA_LEN - 4000 : std::string::npos));
     writeAll(service, "\r\n+POWERKEY: 1\r\n\r\nO");
     writeAll(service, "K\r\n");
     serviceReaderLoop();
-    EXPECT_EQ("\r\n+SN: TS2\r\n\r\nOK\r\n", drainFd(adb));
+    EXPECT_EQ(listing, drainFd(adb));
     EXPECT_EQ("\r\n+POWERKEY: 1\r\n\r\nOK\r\n", host.drain());
 
     // A send into a link whose service has gone fails and closes the link.
